@@ -1,0 +1,37 @@
+#pragma once
+
+// tn::Date: a point in time as seconds since 1970-01-01T00:00:00Z (a double,
+// so sub-second precision survives every encoding), and its ISO 8601 text.
+
+#include <compare>
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace tn {
+
+struct Date {
+  double secondsSince1970 = 0;
+
+  static Date now();
+
+  // Equal when the seconds are equal; NaN dates equal each other so that a
+  // decoded copy of a value always equals the original.
+  friend bool operator==(const Date& a, const Date& b);
+};
+
+// "2026-11-22T20:53:00Z", with as many fractional digits as it takes for
+// parseISO8601 to give back exactly the same double ("...:00.25Z"). Years
+// outside 0000-9999 are written with a sign and at least four digits.
+// Requires hasISO8601Form(date).
+std::string formatISO8601(Date date);
+
+// True for finite dates within about 300 million years of 1970: the dates
+// that have a text form.
+bool hasISO8601Form(Date date);
+
+// Parses what formatISO8601 writes: YYYY-MM-DDTHH:MM:SS[.fraction]Z, UTC only,
+// plus the signed-year form. Returns none for anything else.
+std::optional<Date> parseISO8601(std::string_view text);
+
+}  // namespace tn

@@ -1,0 +1,9 @@
+# The wire codec (CBOR), the typed encoding of forms and the typed reads of
+# message dictionaries.
+target_sources(tn_value PRIVATE
+  CborDecoder.cpp
+  CborEncoder.cpp
+  CborUtf8.cpp
+  MessageValue.cpp
+  TypedEncoding.cpp
+)

@@ -13,7 +13,7 @@
 
 #include "platform/value/Cbor.h"
 #include "platform/value/CborFormat.h"
-#include "platform/value/CborUtf8.h"
+#include "platform/value/Utf8.h"
 
 namespace tn {
 namespace {

@@ -1,25 +1,14 @@
 #pragma once
 
-// Internal to the document readers and writers: UTF-8 as RFC 3629 defines it
-// (no overlong forms, no surrogates, nothing above U+10FFFF) and the
-// characters XML 1.0 can carry as text.
+// Internal to the document readers and writers: the characters XML 1.0 can
+// carry as text.
 
 #include <cstddef>
 #include <string_view>
 
+#include "platform/value/Utf8.h"
+
 namespace tn::document {
-
-struct Utf8Sequence {
-  char32_t codePoint = 0;
-  size_t length = 0;  // 0 when the bytes at the position do not begin a valid sequence
-};
-
-// The character whose encoding begins at text[position] (position < size).
-Utf8Sequence decodeUtf8At(std::string_view text, size_t position);
-
-// The offset of the first byte that does not begin a valid sequence (a
-// sequence cut short by the end counts as invalid), or text.size().
-size_t firstInvalidUtf8(std::string_view text);
 
 // XML 1.0's Char production: tab, LF, CR, U+0020-U+D7FF, U+E000-U+FFFD,
 // U+10000-U+10FFFF.

@@ -90,7 +90,7 @@ class JsonWriter {
   }
 
   bool writeString(std::string_view s) {
-    if (document::firstInvalidUtf8(s) != s.size()) return fail("string that is not valid UTF-8");
+    if (firstInvalidUtf8(s) != s.size()) return fail("string that is not valid UTF-8");
     appendQuotedUtf8(out_, s);
     return true;
   }
@@ -129,7 +129,7 @@ class JsonWriter {
     for (const auto& [key, value] : object) {
       path_.pushKey(key);
       indent(level + 1);
-      if (document::firstInvalidUtf8(key) != key.size()) return fail("key that is not valid UTF-8");
+      if (firstInvalidUtf8(key) != key.size()) return fail("key that is not valid UTF-8");
       appendQuotedUtf8(out_, key);
       out_ += ": ";
       if (!writeValue(value, level + 1, depth)) return false;

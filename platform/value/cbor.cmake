@@ -3,7 +3,7 @@
 target_sources(tn_value PRIVATE
   CborDecoder.cpp
   CborEncoder.cpp
-  CborUtf8.cpp
+  Utf8.cpp
   MessageValue.cpp
   TypedEncoding.cpp
 )

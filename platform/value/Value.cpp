@@ -270,6 +270,8 @@ std::string Value::description() const {
   return out;
 }
 
+std::ostream& operator<<(std::ostream& out, const Value& value) { return out << value.description(); }
+
 const Value& Value::null() {
   static const Value kNull;
   return kNull;

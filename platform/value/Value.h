@@ -23,6 +23,7 @@
 #include <initializer_list>
 #include <memory>
 #include <optional>
+#include <ostream>
 #include <string>
 #include <string_view>
 #include <variant>
@@ -162,6 +163,9 @@ class Dictionary {
   std::vector<Entry> entries_;
   std::vector<uint32_t> index_;  // open addressing over entries_; empty when small
 };
+
+// The description, so that test failures and streams show the value.
+std::ostream& operator<<(std::ostream& out, const Value& value);
 
 }  // namespace tn
 

@@ -1,0 +1,26 @@
+#pragma once
+
+// The identity of a process as the connection layer captured it when the
+// process connected (its own audit token carries the same fields). Plain
+// fields, so this folder does not depend on the connection layer.
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <string>
+
+namespace codesign {
+
+struct ProcessIdentity {
+  pid_t pid = 0;
+  uid_t uid = 0;
+  gid_t gid = 0;
+  // Start time of the process in clock ticks after boot (/proc/<pid>/stat
+  // field 22), which tells a recycled pid from the process.
+  uint64_t startTime = 0;
+  // Absolute path of the executable, read from /proc/<pid>/exe at connection
+  // time; empty when it could not be read.
+  std::string executablePath;
+};
+
+}  // namespace codesign

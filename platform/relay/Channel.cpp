@@ -1,0 +1,258 @@
+#include "platform/relay/Channel.h"
+
+#include <sys/socket.h>
+#include <string.h>
+
+#include <array>
+#include <asio/post.hpp>
+#include <cerrno>
+#include <utility>
+#include <vector>
+
+#include <fmt/format.h>
+
+#include "platform/relay/IoThread.h"
+#include "platform/relay/RelayError.h"
+
+namespace relay::detail {
+namespace {
+
+// One read takes at most this much; a socket gets at most kReadsPerTurn
+// reads before the I/O thread turns to the others.
+constexpr std::size_t kReadChunk = 64 * 1024;
+constexpr int kReadsPerTurn = 4;
+// iovecs per sendmsg.
+constexpr std::size_t kGatherLimit = 16;
+
+std::string describeErrno(std::string_view what, int errnoValue) {
+  const char* text = strerrordesc_np(errnoValue);
+  return fmt::format("{}: {}", what, text != nullptr ? text : "unknown error");
+}
+
+bool wouldBlock(int errnoValue) { return errnoValue == EAGAIN || errnoValue == EWOULDBLOCK; }
+
+}  // namespace
+
+std::shared_ptr<Channel> Channel::create(UniqueFd socket, Callbacks callbacks, std::shared_ptr<void> lease,
+                                         InboundLimits limits) {
+  return std::shared_ptr<Channel>(
+      new Channel(std::move(socket), std::move(callbacks), std::move(lease), limits));
+}
+
+Channel::Channel(UniqueFd socket, Callbacks callbacks, std::shared_ptr<void> lease, InboundLimits limits)
+    : fd_(socket.get()),
+      socket_(ioContext(), socket.release()),
+      callbacks_(std::move(callbacks)),
+      budget_(limits),
+      lease_(std::move(lease)) {}
+
+Channel::~Channel() {
+  // Normally the I/O thread closed the channel and failed its requests. A
+  // channel dropped without a close still owes its handlers an answer.
+  for (PendingReply& pending : pending_.takeAll()) {
+    pending.queue->async([handler = std::move(pending.handler)] {
+      handler(makeRelayError(RelayErrorCode::ConnectionInvalid, "the connection was released"));
+    });
+  }
+}
+
+void Channel::start() {
+  asio::post(ioContext(), [self = shared_from_this()] {
+    if (self->started_) return;
+    self->started_ = true;
+    self->armRead();
+  });
+}
+
+bool Channel::send(tn::Bytes frame, PendingReply* pending) {
+  const std::lock_guard lock(mutex_);
+  if (closing_ || closed_) return false;
+  setFrameId(frame, ++lastSentId_);
+  if (pending != nullptr) pending_.add(lastSentId_, std::move(*pending));
+  outgoing_.append(std::move(frame));
+  if (writeArmed_) {
+    // The I/O thread is waiting to write what is queued ahead; keep order.
+    if (outgoing_.size() > kMaxOutgoingBytes) {
+      requestCloseLocked(CloseCause::OutgoingOverflow,
+                         fmt::format("the peer left more than {} bytes unread", kMaxOutgoingBytes));
+    }
+    return true;
+  }
+  if (const int error = writeQueuedLocked(); error != 0) {
+    requestCloseLocked(CloseCause::PeerClosed, describeErrno("write", error));
+    return true;
+  }
+  if (!outgoing_.empty()) {
+    writeArmed_ = true;
+    asio::post(ioContext(), [self = shared_from_this()] { self->armWrite(); });
+  }
+  return true;
+}
+
+void Channel::close(CloseCause cause, std::string reason) {
+  const std::lock_guard lock(mutex_);
+  if (closing_ || closed_) return;
+  requestCloseLocked(cause, std::move(reason));
+}
+
+void Channel::requestCloseLocked(CloseCause cause, std::string reason) {
+  if (closing_) return;
+  closing_ = true;
+  asio::post(ioContext(), [self = shared_from_this(), cause, reason = std::move(reason)] {
+    self->closeNow(cause, reason);
+  });
+}
+
+void Channel::handled(std::size_t frameLength) {
+  if (budget_.release(frameLength)) {
+    asio::post(ioContext(), [self = shared_from_this()] { self->armRead(); });
+  }
+}
+
+bool Channel::isClosed() const {
+  const std::lock_guard lock(mutex_);
+  return closing_ || closed_;
+}
+
+std::size_t Channel::pendingReplyCount() const {
+  const std::lock_guard lock(mutex_);
+  return pending_.size();
+}
+
+void Channel::armRead() {
+  if (closedOnIoThread_ || readArmed_) return;
+  readArmed_ = true;
+  socket_.async_wait(asio::posix::descriptor_base::wait_read,
+                     [self = shared_from_this()](const asio::error_code& error) {
+                       self->readArmed_ = false;
+                       if (error || self->closedOnIoThread_) return;
+                       self->onReadable();
+                     });
+}
+
+void Channel::onReadable() {
+  // Only the I/O thread reads, so one buffer serves every channel.
+  static std::array<uint8_t, kReadChunk> buffer;
+  const FrameReader::FrameSink sink = [this](RawFrame&& frame) { return dispatch(std::move(frame)); };
+  for (int turn = 0; turn < kReadsPerTurn; ++turn) {
+    const ssize_t n = ::recv(fd_, buffer.data(), buffer.size(), MSG_DONTWAIT);
+    if (n > 0) {
+      const tn::Result<void> read = reader_.consume(std::span(buffer.data(), static_cast<std::size_t>(n)), sink);
+      if (!read.ok()) return closeNow(CloseCause::ProtocolViolation, read.error().message().value_or(""));
+      if (closedOnIoThread_) return;  // the sink found a violation
+      if (static_cast<std::size_t>(n) < buffer.size() || budget_.exhausted()) break;
+      continue;
+    }
+    if (n == 0) return closeNow(CloseCause::PeerClosed, "the peer closed the connection");
+    if (errno == EINTR) continue;
+    if (wouldBlock(errno)) break;
+    return closeNow(CloseCause::PeerClosed, describeErrno("read", errno));
+  }
+  if (budget_.exhausted() && budget_.pause()) return;  // handled() resumes
+  armRead();
+}
+
+bool Channel::dispatch(RawFrame frame) {
+  if (frame.replyTo == 0) {
+    budget_.charge(frame.body.size() + kFrameIdsSize);
+    callbacks_.request(shared_from_this(), std::move(frame));
+    return true;
+  }
+  std::optional<PendingReply> pending;
+  {
+    const std::lock_guard lock(mutex_);
+    pending = pending_.take(frame.replyTo);
+  }
+  if (!pending) {
+    closeNow(CloseCause::ProtocolViolation,
+             fmt::format("frame {} replies to id {}, which no request of ours awaits", frame.id, frame.replyTo));
+    return false;
+  }
+  deliverReply(std::move(*pending), std::move(frame));
+  return true;
+}
+
+void Channel::deliverReply(PendingReply pending, RawFrame frame) {
+  const std::size_t length = frame.body.size() + kFrameIdsSize;
+  budget_.charge(length);
+  pending.queue->async([self = shared_from_this(), handler = std::move(pending.handler),
+                        body = std::move(frame.body), length] {
+    tn::Result<tn::Value> reply = decodeFrameBody(body);
+    if (reply.ok()) {
+      handler(std::move(reply));
+    } else {
+      const std::string reason = reply.error().message().value_or("");
+      handler(makeRelayError(RelayErrorCode::ConnectionInvalid, reason));
+      self->close(CloseCause::ProtocolViolation, reason);
+    }
+    self->handled(length);
+  });
+}
+
+void Channel::armWrite() {
+  if (closedOnIoThread_) return;
+  socket_.async_wait(asio::posix::descriptor_base::wait_write,
+                     [self = shared_from_this()](const asio::error_code& error) {
+                       if (error || self->closedOnIoThread_) return;
+                       self->flush();
+                     });
+}
+
+void Channel::flush() {
+  int error = 0;
+  bool more = false;
+  {
+    const std::lock_guard lock(mutex_);
+    if (closed_) return;
+    error = writeQueuedLocked();
+    more = error == 0 && !outgoing_.empty();
+    writeArmed_ = more;
+  }
+  if (error != 0) return closeNow(CloseCause::PeerClosed, describeErrno("write", error));
+  if (more) armWrite();
+}
+
+int Channel::writeQueuedLocked() {
+  std::array<iovec, kGatherLimit> pieces{};
+  while (!outgoing_.empty()) {
+    msghdr message{};
+    message.msg_iov = pieces.data();
+    message.msg_iovlen = outgoing_.gather(pieces);
+    const ssize_t n = ::sendmsg(fd_, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (n >= 0) {
+      outgoing_.consume(static_cast<std::size_t>(n));
+      continue;
+    }
+    if (errno == EINTR) continue;
+    if (wouldBlock(errno)) return 0;
+    return errno;
+  }
+  return 0;
+}
+
+void Channel::closeNow(CloseCause cause, const std::string& reason) {
+  if (closedOnIoThread_) return;
+  closedOnIoThread_ = true;
+  std::vector<PendingReply> orphans;
+  std::shared_ptr<void> lease;
+  {
+    const std::lock_guard lock(mutex_);
+    if (cause == CloseCause::Cancelled) writeQueuedLocked();  // what the kernel still takes
+    closed_ = true;
+    orphans = pending_.takeAll();
+    outgoing_.clear();
+    lease = std::move(lease_);
+  }
+  asio::error_code ignored;
+  socket_.close(ignored);
+  lease.reset();
+  const std::shared_ptr<Channel> self = shared_from_this();
+  const tn::Error error =
+      callbacks_.closed ? callbacks_.closed(self, cause, reason)
+                        : makeRelayError(RelayErrorCode::ConnectionInvalid, reason);
+  for (PendingReply& pending : orphans) {
+    pending.queue->async([handler = std::move(pending.handler), error] { handler(error); });
+  }
+}
+
+}  // namespace relay::detail

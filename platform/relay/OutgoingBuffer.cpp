@@ -1,0 +1,48 @@
+#include "platform/relay/OutgoingBuffer.h"
+
+#include <algorithm>
+
+namespace relay::detail {
+
+void OutgoingBuffer::append(tn::Bytes frame, std::size_t alreadySent) {
+  if (alreadySent >= frame.size()) return;
+  size_ += frame.size() - alreadySent;
+  if (frames_.empty()) frontOffset_ = alreadySent;
+  else if (alreadySent != 0) frame.erase(frame.begin(), frame.begin() + static_cast<std::ptrdiff_t>(alreadySent));
+  frames_.push_back(std::move(frame));
+}
+
+std::size_t OutgoingBuffer::gather(std::span<iovec> out) const {
+  std::size_t filled = 0;
+  std::size_t offset = frontOffset_;
+  for (auto it = frames_.begin(); it != frames_.end() && filled < out.size(); ++it) {
+    // iovec takes a mutable pointer; sendmsg only reads through it.
+    out[filled].iov_base = const_cast<uint8_t*>(it->data() + offset);
+    out[filled].iov_len = it->size() - offset;
+    ++filled;
+    offset = 0;
+  }
+  return filled;
+}
+
+void OutgoingBuffer::consume(std::size_t count) {
+  size_ -= count;
+  while (count > 0) {
+    const std::size_t remaining = frames_.front().size() - frontOffset_;
+    if (count < remaining) {
+      frontOffset_ += count;
+      return;
+    }
+    count -= remaining;
+    frames_.pop_front();
+    frontOffset_ = 0;
+  }
+}
+
+void OutgoingBuffer::clear() {
+  frames_.clear();
+  frontOffset_ = 0;
+  size_ = 0;
+}
+
+}  // namespace relay::detail

@@ -1,0 +1,45 @@
+// OutgoingBuffer: the frames of one socket that the kernel has not taken yet.
+//
+// Whole frames are appended and leave from the front, so frames never
+// interleave on the wire. Frames are kept as they were encoded (no copy
+// into a ring) and handed to sendmsg() as an iovec list. Internal to
+// platform/relay; not synchronized (the channel guards it with its mutex).
+
+#pragma once
+
+#include <sys/uio.h>
+
+#include <cstddef>
+#include <deque>
+#include <span>
+
+#include "platform/value/Value.h"
+
+namespace relay::detail {
+
+class OutgoingBuffer {
+ public:
+  // Queues `frame`, of which the first `alreadySent` bytes went out already.
+  void append(tn::Bytes frame, std::size_t alreadySent = 0);
+
+  bool empty() const { return size_ == 0; }
+  // Bytes still to send.
+  std::size_t size() const { return size_; }
+
+  // Describes the bytes to send next, in order, in up to out.size() iovecs.
+  // Returns how many it filled. The iovecs stay valid until the next
+  // append() or consume().
+  std::size_t gather(std::span<iovec> out) const;
+
+  // Drops the first `count` bytes (count <= size()), as the kernel took them.
+  void consume(std::size_t count);
+
+  void clear();
+
+ private:
+  std::deque<tn::Bytes> frames_;
+  std::size_t frontOffset_ = 0;  // bytes of frames_.front() already sent
+  std::size_t size_ = 0;
+};
+
+}  // namespace relay::detail

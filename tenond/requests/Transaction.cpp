@@ -1,0 +1,115 @@
+#include "tenond/requests/Transaction.h"
+
+#include <climits>
+#include <cstdlib>
+#include <cstring>
+
+#include "platform/log/Log.h"
+#include "platform/value/MessageValue.h"
+#include "tenond/server/TNDRelayClient.h"
+#include "tenond/server/TNDServer.h"
+
+namespace tnd {
+
+// The request types, tested in this order by exact byte equality. Types
+// whose operations the daemon does not serve yet answer "unrecognized
+// request" until they do.
+const Transaction::Route Transaction::kRoutes[] = {
+    {"add", &Transaction::unrecognized},   {"remove", &Transaction::unrecognized},
+    {"bulk", &Transaction::unrecognized},  {"match", &Transaction::unrecognized},
+    {"ready", &Transaction::unrecognized}, {"access", &Transaction::unrecognized},
+    {"annotate", &Transaction::unrecognized}, {"bulk-annotate", &Transaction::unrecognized},
+    {"lock", &Transaction::unrecognized},  {"find", &Transaction::unrecognized},
+};
+
+Transaction::Transaction(relay::Message request, std::shared_ptr<TNDRelayClient> client)
+    : client_(std::move(client)), request_(std::move(request)) {}
+
+std::shared_ptr<TNDServer> Transaction::server() const { return client_->server(); }
+std::shared_ptr<relay::Connection> Transaction::connection() const { return client_->connection(); }
+
+void Transaction::dispatch() {
+  const std::string* type = relay_dictionary_get_string(request(), "request");
+  version_ = relay_dictionary_get_uint64(request(), "version").value_or(0);
+
+  // The version test comes first, so even a dead client's request gets its
+  // (undeliverable) version error.
+  if ((version_ & ~uint64_t{1}) != 2) {
+    fail(kErrorProtocolVersion, fmt::format("unsupported protocol version {} (current {})",
+                                            static_cast<int32_t>(version_), kCurrentProtocolVersion));
+    return;
+  }
+  if (!client_->acceptWork()) return;
+
+  TN_LOG_DEBUG(tn::log::ops(), "client {} requested {}", client_->pid(), type ? *type : std::string("(null)"));
+  TN_PROBE_REQUEST(client_->pid(), type ? type->c_str() : nullptr);
+  route(type);
+}
+
+void Transaction::route(const std::string* type) {
+  if (!type) {
+    fail(kErrorInvalidRequest, std::string("invalid request format (missing type)"));
+    return;
+  }
+  for (const Route& r : kRoutes) {
+    if (*type == r.type) {
+      (this->*r.operation)();
+      return;
+    }
+  }
+  unrecognized();
+}
+
+void Transaction::unrecognized() { fail(kErrorInvalidRequest, std::string("unrecognized request")); }
+
+void Transaction::done() {
+  tn::Value reply(reply_);
+  TN_PROBE_REQUEST_OUTPUT(client_->pid(), [&] { return reply.description(); });
+  if (auto c = connection()) c->sendReply(request_, std::move(reply));
+}
+
+void Transaction::fail(uint64_t code, const std::optional<std::string>& message) {
+  reply_.set("errorcode", code);
+  if (message) reply_.set("error", *message);
+  done();
+}
+
+void Transaction::fail(uint64_t defaultCode, const tn::Error& error) {
+  if (error.domain() == tn::kTenonErrorDomain)
+    fail(static_cast<uint64_t>(error.code()), error.message());
+  else
+    fail(defaultCode, error.localizedDescription());
+}
+
+bool Transaction::marshalPaths(const PathOperation& operation) {
+  const tn::Array* paths = relay_dictionary_get_array(request(), "paths");
+  if (!paths) {
+    fail(kErrorInvalidRequest, std::string("invalid request format"));
+    return false;
+  }
+  for (const tn::Value& element : *paths) {
+    const std::string* path = element.string();
+    if (!path) {
+      fail(kErrorInvalidRequest, std::string("invalid request format"));
+      return false;
+    }
+    if (path->empty() || path->front() != '/') {
+      fail(kErrorBadPath, fmt::format("absolute path required: {}", *path));
+      return false;
+    }
+    // A path that does not exist, or whose canonical form would not fit the
+    // 1024 bytes the daemon allows, goes on unresolved.
+    char resolved[PATH_MAX];
+    const bool ok = realpath(path->c_str(), resolved) != nullptr && std::strlen(resolved) < 1024;
+    if (!operation(ok ? std::string(resolved) : *path, ok)) return false;
+  }
+  return true;
+}
+
+bool Transaction::processPaths(const PathOperation& operation) {
+  if (!marshalPaths(operation)) return false;
+  done();
+  return true;
+}
+
+}  // namespace tnd

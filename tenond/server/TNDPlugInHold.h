@@ -1,0 +1,49 @@
+#pragma once
+
+// A hold on plug-ins: while it is in force the daemon refuses to make the
+// held plug-ins launchable and leaves them out of discovery. Each hold keeps
+// the daemon from being idle (one unit of the relay keep-alive count) for its
+// whole life.
+
+#include <memory>
+#include <unordered_set>
+#include <vector>
+
+#include "platform/value/Date.h"
+#include "platform/value/UUID.h"
+
+namespace tnd {
+
+class TNDRelayClient;
+
+class TNDPlugInHold {
+ public:
+  // A new hold with a fresh random token on the plug-ins named by their
+  // UUIDs (duplicates collapse), placed by `client` (kept weakly).
+  TNDPlugInHold(const std::vector<tn::UUID>& plugIns, std::weak_ptr<TNDRelayClient> client);
+  ~TNDPlugInHold();
+
+  TNDPlugInHold(const TNDPlugInHold&) = delete;
+  TNDPlugInHold& operator=(const TNDPlugInHold&) = delete;
+
+  const tn::UUID& uuid() const { return uuid_; }
+  bool blocks(const tn::UUID& plugIn) const { return blocked_.count(plugIn) != 0; }
+  size_t blockedCount() const { return blocked_.size(); }
+  // The client, or none once it has been destroyed.
+  std::shared_ptr<TNDRelayClient> client() const { return client_.lock(); }
+  // True when the hold was placed by this very client object (compared by
+  // ownership, so a later client at the same address is never taken for it).
+  bool placedBy(const std::shared_ptr<TNDRelayClient>& client) const;
+  tn::Date created() const { return created_; }
+
+  // Holds are equal when their tokens are.
+  friend bool operator==(const TNDPlugInHold& a, const TNDPlugInHold& b) { return a.uuid_ == b.uuid_; }
+
+ private:
+  const tn::UUID uuid_;
+  const std::unordered_set<tn::UUID> blocked_;
+  const std::weak_ptr<TNDRelayClient> client_;
+  const tn::Date created_;
+};
+
+}  // namespace tnd

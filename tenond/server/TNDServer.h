@@ -1,0 +1,93 @@
+#pragma once
+
+// tenond/server: the one server object of the daemon, its client
+// connections and its holds.
+//
+// TNDServer owns the listening endpoint of the named service, the queues on
+// which all work runs, and the list of holds. It is also the plug-in
+// database (it derives from TNDatabase) and that database's delegate.
+//
+// Queues: "relay" gets the listener's events; "service" (quality of service
+// 25) runs every transaction of every client, one at a time, in submission
+// order; "serverSync" guards the hold list and is only entered
+// synchronously. Lock order: "service" may enter "serverSync"; code on
+// "serverSync" enters no other queue.
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/dispatch/SerialQueue.h"
+#include "platform/relay/Listener.h"
+#include "tenond/database/TNDatabase.h"
+
+namespace tnd {
+
+class TNDPlugInHold;
+class TNDRelayClient;
+
+inline constexpr const char* kAnnotationChangeNotification = "com.ostrel.tenon.annotation-change";
+inline constexpr int kServiceQualityOfService = 25;  // user-initiated
+
+class TNDServer final : public TNDatabase,
+                        public TNDatabaseDelegate,
+                        public std::enable_shared_from_this<TNDServer> {
+ public:
+  // Builds the server for `serviceName` with the annotation file at
+  // `databasePath` (none: the default location) and stores it as the
+  // process's server. The listener is bound but suspended: nothing is
+  // accepted before run(). Returns none, having logged why, when the
+  // database or the listener cannot be made.
+  static std::shared_ptr<TNDServer> initForService(const std::string& serviceName,
+                                                   const std::optional<std::string>& databasePath);
+
+  // The process's server, or none before construction.
+  static std::shared_ptr<TNDServer> server();
+
+  // Resumes the listener, then runs the main loop for good.
+  [[noreturn]] void run();
+
+  // Queues `work` on the service queue and returns at once.
+  void submitWork(std::function<void()> work);
+
+  // Cancels the listener, releases every hold and posts the
+  // annotation-change notification (even with no holds). Runs on the main
+  // queue (the SIGTERM handler).
+  void stop();
+
+  // Holds. All of them enter "serverSync" synchronously.
+  bool holdOnPlugIn(const tn::UUID& plugIn);
+  void addHold(std::shared_ptr<TNDPlugInHold> hold);
+  void unholdToken(const tn::UUID& token);
+  void unholdClient(const std::shared_ptr<TNDRelayClient>& client);
+  size_t holdCount();
+
+  // TNDatabaseDelegate. Terminating the running instances of removed
+  // plug-ins comes with the supervisor; for now the removal is logged.
+  void removedPlugIns(const std::vector<std::string>& identifiers) override;
+
+  uint32_t verbose() const { return verbose_; }
+  void setVerbose(uint32_t verbose) { verbose_ = verbose; }
+  const std::shared_ptr<tn::dispatch::SerialQueue>& relayQueue() const { return relayQueue_; }
+  const std::shared_ptr<tn::dispatch::SerialQueue>& mainQueue() const { return mainQueue_; }
+  const std::shared_ptr<tn::dispatch::SerialQueue>& syncQueue() const { return syncQueue_; }
+  const std::shared_ptr<relay::Listener>& service() const { return service_; }
+
+ private:
+  TNDServer() = default;
+  void installListenerHandlers();
+  void postAnnotationChange();
+
+  std::atomic<uint32_t> verbose_{0};
+  std::shared_ptr<tn::dispatch::SerialQueue> relayQueue_;
+  std::shared_ptr<tn::dispatch::SerialQueue> mainQueue_;
+  std::shared_ptr<tn::dispatch::SerialQueue> syncQueue_;
+  std::shared_ptr<relay::Listener> service_;
+  std::vector<std::shared_ptr<TNDPlugInHold>> holds_;  // on syncQueue_ only
+};
+
+}  // namespace tnd

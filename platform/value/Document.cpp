@@ -83,8 +83,19 @@ Result<Value> readDocument(std::string_view bytes, std::string_view name, Docume
 }
 
 Result<Value> readDocumentFile(const std::string& path) {
-  const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  // Non-blocking, and only regular files: a FIFO or a device planted where a
+  // manifest should be must not hang the reader.
+  const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
   if (fd < 0) return unreadable(path, errno);
+  struct stat status {};
+  if (::fstat(fd, &status) != 0 || !S_ISREG(status.st_mode)) {
+    const int error = errno;
+    ::close(fd);
+    if (S_ISDIR(status.st_mode)) return unreadable(path, EISDIR);
+    if (!S_ISREG(status.st_mode) && status.st_mode != 0)
+      return document::documentError(DocumentErrorCode::Unreadable, fmt::format("{}: not a regular file", path));
+    return unreadable(path, error);
+  }
   Result<std::string> bytes = readAll(fd, path);
   ::close(fd);
   if (!bytes) return bytes.error();

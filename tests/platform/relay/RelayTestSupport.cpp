@@ -126,18 +126,22 @@ Client::~Client() {
 }
 
 Reply Client::request(tn::Value body) {
-  std::optional<Reply> reply;
-  tn::dispatch::Semaphore done;
+  // Shared with the handler, which may outlive this call when the reply is late.
+  struct Wait {
+    std::optional<Reply> reply;
+    tn::dispatch::Semaphore done;
+  };
+  const auto wait = std::make_shared<Wait>();
   const auto replyQueue = tn::dispatch::SerialQueue::create("test.reply");
-  connection->sendWithReply(std::move(body), replyQueue, [&](Reply received) {
-    reply = std::move(received);
-    done.signal();
+  connection->sendWithReply(std::move(body), replyQueue, [wait](Reply received) {
+    wait->reply = std::move(received);
+    wait->done.signal();
   });
-  if (!done.waitFor(std::chrono::duration_cast<std::chrono::milliseconds>(kPatience))) {
+  if (!wait->done.waitFor(std::chrono::duration_cast<std::chrono::milliseconds>(kPatience))) {
     ADD_FAILURE() << "no reply";
     return tn::Error("test", 1, "no reply");
   }
-  return *reply;
+  return *wait->reply;
 }
 
 RawClient::RawClient(const std::string& serviceName) : fd_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {

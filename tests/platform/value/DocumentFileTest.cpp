@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -125,6 +126,26 @@ TEST(DocumentExamples, TheRepositoryExamplesReadAsExpected) {
   ASSERT_FALSE(broken);
   EXPECT_EQ(broken.error().localizedDescription().rfind(examples + "broken.json:6: ", 0), 0u)
       << broken.error().localizedDescription();
+}
+
+}  // namespace
+}  // namespace tn
+
+namespace tn {
+namespace {
+
+TEST(DocumentFileKinds, OnlyRegularFilesAreReadSoAFifoCannotHangTheReader) {
+  const std::filesystem::path dir =
+      std::filesystem::temp_directory_path() / ("document-fifo-test-" + std::to_string(::getpid()));
+  std::filesystem::create_directories(dir);
+  const std::string fifo = (dir / "Info.manifest").string();
+  ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
+  auto fromFifo = readDocumentFile(fifo);
+  ASSERT_FALSE(fromFifo);
+  EXPECT_EQ(fromFifo.error().localizedDescription(), fifo + ": not a regular file");
+  auto fromDirectory = readDocumentFile(dir.string());
+  EXPECT_FALSE(fromDirectory);
+  std::filesystem::remove_all(dir);
 }
 
 }  // namespace

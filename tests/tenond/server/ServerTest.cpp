@@ -1,0 +1,186 @@
+// TNDServer, TNDRelayClient and Transaction in one process: a real server on
+// a private TENON_ROOT, real relay connections from this process to it.
+
+#include <gtest/gtest.h>
+
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <future>
+#include <thread>
+
+#include "platform/dispatch/Semaphore.h"
+#include "platform/log/Log.h"
+#include "platform/notify/Post.h"
+#include "platform/relay/Connection.h"
+#include "platform/relay/Listener.h"
+#include "tenond/requests/Transaction.h"
+#include "tenond/server/TNDPlugInHold.h"
+#include "tenond/server/TNDRelayClient.h"
+#include "tenond/server/TNDServer.h"
+
+namespace tnd {
+namespace {
+
+namespace fs = std::filesystem;
+using tn::Dictionary;
+using tn::Value;
+
+// One server per process (the daemon has exactly one); every test shares it.
+class Server : public ::testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    root_ = fs::temp_directory_path() / ("tenond-server-test-" + std::to_string(getpid()));
+    fs::create_directories(root_ / "etc/tenon/entitlements.d");
+    setenv("TENON_ROOT", root_.c_str(), 1);
+    grantThisProgram();
+    tn::log::configure("debug");
+    server_ = TNDServer::initForService("server.test", std::nullopt);
+    ASSERT_TRUE(server_);
+    server_->service()->resume();
+  }
+  static void TearDownTestSuite() { fs::remove_all(root_); }
+
+  // This test program is the peer; a root-owned document in entitlements.d
+  // grants it a few entitlements of every shape.
+  static void grantThisProgram() {
+    const std::string self = fs::read_symlink("/proc/self/exe").string();
+    std::ofstream(root_ / "etc/tenon/entitlements.d/server-test.manifest")
+        << R"({"executable": ")" << self << R"(", "entitlements": {"com.test.yes": true, "com.test.zero": 0,)"
+        << R"( "com.test.no": false, "com.test.text": "x", "com.test.list": [1]}})";
+  }
+
+  // A connection from this process, and the daemon's client object for it.
+  struct Pair {
+    std::shared_ptr<relay::Connection> peer;
+    std::shared_ptr<TNDRelayClient> client;
+  };
+  Pair connect() {
+    // A listener of the test's own hands each new connection to the real
+    // client set-up, so that the test holds the client object.
+    static int serial = 0;
+    const std::string service = "server.test.pair" + std::to_string(serial++);
+    auto listener = relay::Listener::create(service, tn::dispatch::SerialQueue::create("pair"));
+    EXPECT_TRUE(listener);
+    std::promise<std::shared_ptr<TNDRelayClient>> made;
+    (*listener)->setNewConnectionHandler([&](std::shared_ptr<relay::Connection> c) {
+      made.set_value(TNDRelayClient::initWithConnection(std::move(c), server_));
+    });
+    (*listener)->resume();
+    auto peer = relay::Connection::connectToService(service, replies_);
+    EXPECT_TRUE(peer);
+    (*peer)->setEventHandler([](const relay::Event&) {});
+    (*peer)->resume();
+    Pair pair{*peer, made.get_future().get()};
+    (*listener)->cancel();
+    return pair;
+  }
+
+  // The reply to `body`, or null after half a second of silence.
+  Value request(const Pair& pair, Dictionary body, std::chrono::milliseconds wait = std::chrono::seconds(5)) {
+    tn::dispatch::Semaphore done;
+    auto reply = std::make_shared<Value>();
+    pair.peer->sendWithReply(Value(std::move(body)), replies_, [reply, &done](relay::Reply r) {
+      if (r) *reply = *r;
+      done.signal();
+    });
+    if (!done.waitFor(wait)) return Value();
+    return *reply;
+  }
+
+  static uint64_t annotationChanges() { return *notify::postCount(kAnnotationChangeNotification); }
+
+  template <typename Condition>
+  static bool eventually(Condition condition) {
+    for (int i = 0; i < 500; ++i) {
+      if (condition()) return true;
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    return false;
+  }
+
+  static inline fs::path root_;
+  static inline std::shared_ptr<TNDServer> server_;
+  std::shared_ptr<tn::dispatch::SerialQueue> replies_ = tn::dispatch::SerialQueue::create("replies");
+};
+
+TEST_F(Server, IsTheProcessServerWithItsQueues) {
+  EXPECT_EQ(TNDServer::server(), server_);
+  EXPECT_EQ(server_->mainQueue()->label(), "service");
+  EXPECT_EQ(server_->mainQueue()->qualityOfService(), 25);
+  EXPECT_EQ(server_->relayQueue()->label(), "relay");
+  EXPECT_EQ(server_->syncQueue()->label(), "serverSync");
+  EXPECT_EQ(server_->annotationsPath(), root_.string() + "/var/db/Tenon-Annotations");
+}
+
+TEST_F(Server, ClientKnowsItsPeerAndItsEntitlements) {
+  Pair pair = connect();
+  EXPECT_EQ(pair.client->pid(), getpid());
+  EXPECT_EQ(pair.client->path(), fs::read_symlink("/proc/self/exe").string());
+  EXPECT_TRUE(pair.client->hasEntitlement("com.test.yes"));
+  EXPECT_TRUE(pair.client->hasEntitlement("com.test.text"));
+  EXPECT_TRUE(pair.client->hasEntitlement("com.test.list"));
+  EXPECT_FALSE(pair.client->hasEntitlement("com.test.no"));
+  EXPECT_FALSE(pair.client->hasEntitlement("com.test.zero"));
+  EXPECT_FALSE(pair.client->hasEntitlement("com.test.absent"));
+  EXPECT_FALSE(pair.client->isSandboxed());
+  EXPECT_NE(pair.client->description().find("pid=" + std::to_string(getpid())), std::string::npos);
+}
+
+TEST_F(Server, ADeadClientLosesEveryHoldWithOneLineAndOneNotificationEach) {
+  tn::log::ScopedCaptureSink capture;
+  Pair pair = connect();
+  Pair other = connect();
+  server_->addHold(std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{tn::UUID::random()}, pair.client));
+  server_->addHold(std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{tn::UUID::random()}, pair.client));
+  auto kept = std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{tn::UUID::random()}, other.client);
+  server_->addHold(kept);
+  const uint64_t before = annotationChanges();
+
+  pair.peer->cancel();
+  ASSERT_TRUE(eventually([&] { return !pair.client->acceptWork(); }));
+  EXPECT_EQ(server_->holdCount(), 1u);
+  EXPECT_EQ(capture->count("ops", tn::log::Level::Debug, "for dead client pid " + std::to_string(getpid())), 2u);
+  EXPECT_EQ(annotationChanges(), before + 2);
+  EXPECT_TRUE(capture->contains("ops", tn::log::Level::Debug, "is dead"));
+
+  server_->unholdToken(kept->uuid());
+  EXPECT_EQ(server_->holdCount(), 0u);
+  EXPECT_EQ(annotationChanges(), before + 3);
+  server_->unholdToken(kept->uuid());  // an unknown token changes nothing
+  EXPECT_EQ(annotationChanges(), before + 3);
+}
+
+TEST_F(Server, HoldsBlockTheirPlugInsUntilReleased) {
+  Pair pair = connect();
+  const tn::UUID held = tn::UUID::random(), free = tn::UUID::random();
+  auto hold = std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{held, held}, pair.client);
+  EXPECT_EQ(hold->blockedCount(), 1u);
+  server_->addHold(hold);
+  EXPECT_TRUE(server_->holdOnPlugIn(held));
+  EXPECT_FALSE(server_->holdOnPlugIn(free));
+  server_->unholdToken(hold->uuid());
+  EXPECT_FALSE(server_->holdOnPlugIn(held));
+}
+
+TEST_F(Server, AClientThatNoLongerAcceptsWorkGetsOnlyItsVersionErrors) {
+  Pair pair = connect();
+  EXPECT_EQ(request(pair, {{"version", 3u}, {"request", "x"}})["errorcode"], Value(4u));
+  pair.client->setAcceptWork(false);
+  EXPECT_TRUE(request(pair, {{"version", 3u}, {"request", "x"}}, std::chrono::milliseconds(300)).isNull());
+  EXPECT_EQ(request(pair, {{"version", 1u}})["errorcode"], Value(7u));
+}
+
+TEST_F(Server, DescriptionSaysWhenTheConnectionIsGone) {
+  Pair pair = connect();
+  std::weak_ptr<relay::Connection> serverSide = pair.client->connection();
+  pair.peer->cancel();
+  ASSERT_TRUE(eventually([&] { return serverSide.expired(); }));
+  EXPECT_NE(pair.client->description().find("NO CONNECTION"), std::string::npos) << pair.client->description();
+}
+
+}  // namespace
+}  // namespace tnd

@@ -78,9 +78,10 @@ class Listener {
   const std::string& socketPath() const;
   bool isSocketActivated() const;
 
-  struct Core;  // the state the I/O thread shares; in Listener.cpp
 
  private:
+  struct Core;  // the state the I/O thread shares; in Listener.cpp
+
   explicit Listener(std::shared_ptr<Core> core);
 
   // Makes the server connection for an identified socket (Connection

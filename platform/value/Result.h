@@ -27,6 +27,7 @@ class [[nodiscard]] Result {
   const T& operator*() const& { return value(); }
   T& operator*() & { return value(); }
   const T* operator->() const { return &value(); }
+  T* operator->() { return &value(); }
 
   // Requires !ok().
   const Error& error() const { assert(!ok()); return std::get<Error>(state_); }

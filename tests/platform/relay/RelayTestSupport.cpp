@@ -3,38 +3,31 @@
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
-#include <cstring>
 #include <filesystem>
 #include <thread>
 
 #include "platform/dispatch/Semaphore.h"
 #include "platform/relay/Frame.h"
 #include "platform/relay/ServicePath.h"
+#include "platform/value/Cbor.h"
 
 namespace relay::test {
 
 TempRoot::TempRoot() {
-  // Short, because socket paths must fit a sockaddr_un.
-  char pattern[] = "/tmp/relay-XXXXXX";
-  const char* made = ::mkdtemp(pattern);
-  if (made == nullptr) {
-    ADD_FAILURE() << "mkdtemp: " << std::strerror(errno);
-    return;
-  }
-  path_ = made;
-  if (const char* previous = std::getenv("TENON_ROOT")) previous_ = previous;
+  char pattern[] = "/tmp/relay-XXXXXX";  // short: socket paths must fit a sockaddr_un
+  if (::mkdtemp(pattern) == nullptr) ADD_FAILURE() << "mkdtemp failed";
+  path_ = pattern;
   ::setenv("TENON_ROOT", path_.c_str(), 1);
 }
 
 TempRoot::~TempRoot() {
-  if (previous_) ::setenv("TENON_ROOT", previous_->c_str(), 1);
-  else ::unsetenv("TENON_ROOT");
+  ::unsetenv("TENON_ROOT");
   std::error_code ignored;
-  if (!path_.empty()) std::filesystem::remove_all(path_, ignored);
+  std::filesystem::remove_all(path_, ignored);
 }
 
 bool eventually(const std::function<bool()>& condition) {
@@ -52,32 +45,29 @@ std::vector<Event::Kind> EventRecorder::kinds() const {
   return kinds;
 }
 
-bool EventRecorder::waitForKind(Event::Kind kind) {
-  return eventually([&] {
-    for (const Event::Kind seen : kinds()) {
-      if (seen == kind) return true;
-    }
-    return false;
-  });
+int EventRecorder::count(Event::Kind kind) const {
+  const auto all = kinds();
+  return static_cast<int>(std::count(all.begin(), all.end(), kind));
 }
 
-Server::Server(std::string serviceName, Responder respond)
-    : respond_(std::move(respond)), queue_(tn::dispatch::SerialQueue::create("test.listener")) {
-  tn::Result<std::shared_ptr<Listener>> listener = Listener::create(std::move(serviceName), queue_);
+bool EventRecorder::waitForKind(Event::Kind kind) {
+  return eventually([&] { return count(kind) > 0; });
+}
+
+Server::Server(std::string serviceName, Responder respond) : respond_(std::move(respond)) {
+  auto listener = Listener::create(std::move(serviceName), queue_);
   if (!listener.ok()) {
-    ADD_FAILURE() << "Listener::create: " << listener.error().description();
+    ADD_FAILURE() << listener.error().description();
     return;
   }
   listener_ = *listener;
   listener_->setNewConnectionHandler([this](std::shared_ptr<Connection> connection) {
     auto events = std::make_shared<EventRecorder>();
-    const std::weak_ptr<Connection> weak = connection;
-    connection->setEventHandler([this, events, weak](const Event& event) {
+    connection->setEventHandler([this, events, weak = std::weak_ptr(connection)](const Event& event) {
       events->add(event);
       const auto self = weak.lock();
       if (event.kind != Event::Kind::Message || !self || !respond_) return;
-      tn::Value reply = respond_(event.message);
-      if (!reply.isNull()) self->sendReply(event.message, std::move(reply));
+      if (tn::Value reply = respond_(event.message); !reply.isNull()) self->sendReply(event.message, reply);
     });
     connection->resume();
     accepted_.add({std::move(connection), std::move(events)});
@@ -87,12 +77,10 @@ Server::Server(std::string serviceName, Responder respond)
 
 Server::~Server() {
   if (listener_) listener_->cancel();
-  queue_->sync([] {});  // no connection is admitted after this
+  queue_->sync([] {});  // nothing is admitted after this
   for (const Accepted& accepted : accepted_.snapshot()) accepted.connection->cancel();
-  // Wait until the handlers are done with `this` (ConnectionInvalid is last).
-  for (const Accepted& accepted : accepted_.snapshot()) {
-    accepted.events->waitForKind(Event::Kind::ConnectionInvalid);
-  }
+  // The handlers use `this` until ConnectionInvalid, their last event.
+  for (const Accepted& accepted : accepted_.snapshot()) accepted.events->waitForKind(Event::Kind::ConnectionInvalid);
 }
 
 tn::Value Server::echo(const Message& request) { return tn::Value(tn::Dictionary{{"echo", request.body}}); }
@@ -103,15 +91,15 @@ std::shared_ptr<Connection> Server::connection(std::size_t index) {
 }
 
 EventRecorder& Server::events(std::size_t index) {
-  const auto all = accepted_.waitFor(index + 1);
   static EventRecorder none;
+  const auto all = accepted_.waitFor(index + 1);
   return all.size() > index ? *all[index].events : none;
 }
 
-Client::Client(const std::string& serviceName) : queue(tn::dispatch::SerialQueue::create("test.client")) {
-  tn::Result<std::shared_ptr<Connection>> made = Connection::connectToService(serviceName, queue);
+Client::Client(const std::string& serviceName) {
+  auto made = Connection::connectToService(serviceName, tn::dispatch::SerialQueue::create("test.client"));
   if (!made.ok()) {
-    ADD_FAILURE() << "connectToService: " << made.error().description();
+    ADD_FAILURE() << made.error().description();
     return;
   }
   connection = *made;
@@ -126,54 +114,67 @@ Client::~Client() {
 }
 
 Reply Client::request(tn::Value body) {
-  // Shared with the handler, which may outlive this call when the reply is late.
-  struct Wait {
+  struct Wait {  // shared with the handler, which may come after a timeout
     std::optional<Reply> reply;
     tn::dispatch::Semaphore done;
   };
   const auto wait = std::make_shared<Wait>();
-  const auto replyQueue = tn::dispatch::SerialQueue::create("test.reply");
-  connection->sendWithReply(std::move(body), replyQueue, [wait](Reply received) {
-    wait->reply = std::move(received);
+  connection->sendWithReply(std::move(body), tn::dispatch::SerialQueue::create("test.reply"), [wait](Reply reply) {
+    wait->reply = std::move(reply);
     wait->done.signal();
   });
-  if (!wait->done.waitFor(std::chrono::duration_cast<std::chrono::milliseconds>(kPatience))) {
-    ADD_FAILURE() << "no reply";
-    return tn::Error("test", 1, "no reply");
-  }
-  return *wait->reply;
+  if (wait->done.waitFor(kPatience)) return *wait->reply;
+  ADD_FAILURE() << "no reply";
+  return tn::Error("test", 1, "no reply");
 }
 
-RawClient::RawClient(const std::string& serviceName) : fd_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-  const std::string path = pathOf(serviceName);
+tn::Bytes rawFrameWithBody(uint64_t id, uint64_t replyTo, const tn::Bytes& body) {
+  tn::Bytes frame(kFrameHeaderSize);
+  storeBigEndian32(frame.data(), static_cast<uint32_t>(kFrameIdsSize + body.size()));
+  storeBigEndian64(frame.data() + 4, id);
+  storeBigEndian64(frame.data() + 12, replyTo);
+  frame.insert(frame.end(), body.begin(), body.end());
+  return frame;
+}
+
+tn::Bytes rawFrame(uint64_t id, uint64_t replyTo, const tn::Value& body) {
+  return rawFrameWithBody(id, replyTo, tn::encodeCbor(body));
+}
+
+tn::Bytes nestedBody(int depth) {
+  tn::Bytes body;
+  for (int i = 1; i < depth; ++i) body.insert(body.end(), {0xa1, 0x61, 'k'});
+  body.push_back(0xa0);
+  return body;
+}
+
+tn::Value numbered(uint64_t n) { return tn::Value(tn::Dictionary{{"n", n}}); }
+
+RawClient::RawClient(const std::string& socketPath) : fd_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
-  std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
+  socketPath.copy(address.sun_path, sizeof address.sun_path - 1);
   if (::connect(fd_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) fd_.reset();
 }
 
 void RawClient::write(const tn::Bytes& bytes) {
-  std::size_t written = 0;
-  while (written < bytes.size()) {
+  for (std::size_t written = 0; written < bytes.size();) {
     const ssize_t n = ::send(fd_.get(), bytes.data() + written, bytes.size() - written, MSG_NOSIGNAL);
     if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) return;  // the peer is gone; the test looks at that separately
+    if (n <= 0) return;  // the peer is gone; tests look at that separately
     written += static_cast<std::size_t>(n);
   }
 }
 
 bool RawClient::readExactly(uint8_t* out, std::size_t size) {
   const auto deadline = std::chrono::steady_clock::now() + kPatience;
-  std::size_t got = 0;
-  while (got < size) {
-    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
-    if (left.count() <= 0) return false;
+  for (std::size_t got = 0; got < size;) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
     pollfd entry{fd_.get(), POLLIN, 0};
-    if (::poll(&entry, 1, static_cast<int>(left.count())) <= 0) continue;
+    if (::poll(&entry, 1, 100) <= 0) continue;
     const ssize_t n = ::recv(fd_.get(), out + got, size - got, 0);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) return false;
-    got += static_cast<std::size_t>(n);
+    if (n <= 0 && !(n < 0 && errno == EINTR)) return false;
+    if (n > 0) got += static_cast<std::size_t>(n);
   }
   return true;
 }
@@ -181,29 +182,22 @@ bool RawClient::readExactly(uint8_t* out, std::size_t size) {
 std::optional<RawFrame> RawClient::readFrame() {
   uint8_t header[kFrameHeaderSize];
   if (!readExactly(header, sizeof header)) return std::nullopt;
-  RawFrame frame;
-  frame.id = loadBigEndian64(header + kFrameLengthSize);
-  frame.replyTo = loadBigEndian64(header + kFrameLengthSize + 8);
-  frame.body.resize(loadBigEndian32(header) - kFrameIdsSize);
+  RawFrame frame{loadBigEndian64(header + 4), loadBigEndian64(header + 12),
+                 tn::Bytes(loadBigEndian32(header) - kFrameIdsSize)};
   if (!readExactly(frame.body.data(), frame.body.size())) return std::nullopt;
   return frame;
 }
 
 bool RawClient::waitForClose() {
-  const auto deadline = std::chrono::steady_clock::now() + kPatience;
   uint8_t buffer[4096];
-  while (std::chrono::steady_clock::now() < deadline) {
+  return eventually([&] {
     pollfd entry{fd_.get(), POLLIN, 0};
-    if (::poll(&entry, 1, 100) <= 0) continue;
-    const ssize_t n = ::recv(fd_.get(), buffer, sizeof buffer, 0);
-    if (n == 0 || (n < 0 && errno != EINTR && errno != EAGAIN)) return true;
-  }
-  return false;
+    if (::poll(&entry, 1, 10) <= 0) return false;
+    const ssize_t n = ::recv(fd_.get(), buffer, sizeof buffer, MSG_DONTWAIT);
+    return n == 0 || (n < 0 && errno != EINTR && errno != EAGAIN);
+  });
 }
 
-std::string pathOf(const std::string& serviceName) {
-  tn::Result<std::string> path = servicePath(serviceName);
-  return path.ok() ? *path : std::string();
-}
+std::string pathOf(const std::string& serviceName) { return servicePath(serviceName).value(); }
 
 }  // namespace relay::test

@@ -1,7 +1,8 @@
 // Helpers of the relay tests: a private TENON_ROOT per test, waiting for
-// what other threads record, a server that answers requests, and a plain
-// socket client for raw bytes. Waits give up after 20 seconds so that a
-// broken build fails instead of hanging; no test depends on speed.
+// what other threads record, a server that answers requests, a client, raw
+// frames and a plain socket for speaking the wire directly. Waits give up
+// after 20 seconds so that a broken build fails instead of hanging; no test
+// depends on speed.
 
 #pragma once
 
@@ -9,7 +10,6 @@
 
 #include <chrono>
 #include <condition_variable>
-#include <cstdint>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -18,11 +18,10 @@
 #include <vector>
 
 #include "platform/dispatch/SerialQueue.h"
+#include "platform/log/CaptureSink.h"
 #include "platform/relay/Connection.h"
 #include "platform/relay/FrameReader.h"
 #include "platform/relay/Listener.h"
-#include "platform/relay/UniqueFd.h"
-#include "platform/value/Value.h"
 
 namespace relay::test {
 
@@ -39,15 +38,20 @@ class TempRoot {
 
  private:
   std::string path_;
-  std::optional<std::string> previous_;
 };
 
+// Tests with sockets: a private root; the log captured (violations are
+// logged as errors, and tests may assert on them).
 class RelayTest : public ::testing::Test {
  protected:
   TempRoot root_;
+  tn::log::ScopedCaptureSink log_;
 };
 
-// Values recorded by other threads, with waiting.
+// Polls `condition` until it holds; false after kPatience.
+bool eventually(const std::function<bool()>& condition);
+
+// Values recorded by other threads.
 template <typename T>
 class Recorder {
  public:
@@ -56,8 +60,7 @@ class Recorder {
     values_.push_back(std::move(value));
     changed_.notify_all();
   }
-  // Waits until at least `count` values are there; returns them all. Fails
-  // the test (and returns what there is) when they do not come.
+  // Waits until there are at least `count` values; returns them all.
   std::vector<T> waitFor(std::size_t count) {
     std::unique_lock lock(mutex_);
     if (!changed_.wait_for(lock, kPatience, [&] { return values_.size() >= count; })) {
@@ -69,10 +72,7 @@ class Recorder {
     const std::lock_guard lock(mutex_);
     return values_;
   }
-  std::size_t size() const {
-    const std::lock_guard lock(mutex_);
-    return values_.size();
-  }
+  std::size_t size() const { return snapshot().size(); }
 
  private:
   mutable std::mutex mutex_;
@@ -80,38 +80,30 @@ class Recorder {
   std::vector<T> values_;
 };
 
-// Polls `condition` until it holds; false after kPatience.
-bool eventually(const std::function<bool()>& condition);
-
-// Records a connection's events; install with connection->setEventHandler(recorder.handler()).
+// A connection's events: connection->setEventHandler(recorder.handler()).
 class EventRecorder : public Recorder<Event> {
  public:
   Connection::EventHandler handler() {
     return [this](const Event& event) { add(event); };
   }
-  // The kinds recorded so far, in order.
   std::vector<Event::Kind> kinds() const;
+  int count(Event::Kind kind) const;
   // Waits for an event of `kind`; false when none came.
   bool waitForKind(Event::Kind kind);
 };
 
 // A resumed listener whose connections answer each request with
-// respond(request) when that returns a value (and do not answer when it
-// returns null). Records the connections it accepted and their events.
+// respond(request), unless that is null (no reply).
 class Server {
  public:
   using Responder = std::function<tn::Value(const Message&)>;
-
   Server(std::string serviceName, Responder respond);
-  ~Server();
-
-  // Echoes the body back as {"echo": body}.
-  static tn::Value echo(const Message& request);
+  ~Server();  // cancels the listener and every connection it made
+  static tn::Value echo(const Message& request);  // {"echo": body}
 
   Listener& listener() { return *listener_; }
-  // The nth accepted connection (0-based), waiting for it.
+  // The nth accepted connection (from 0), and its events, waiting for it.
   std::shared_ptr<Connection> connection(std::size_t index);
-  // The events of the nth accepted connection.
   EventRecorder& events(std::size_t index);
   std::size_t connectionCount() const { return accepted_.size(); }
 
@@ -120,38 +112,40 @@ class Server {
     std::shared_ptr<Connection> connection;
     std::shared_ptr<EventRecorder> events;
   };
-
   Responder respond_;
-  std::shared_ptr<tn::dispatch::SerialQueue> queue_;
+  std::shared_ptr<tn::dispatch::SerialQueue> queue_ = tn::dispatch::SerialQueue::create("test.listener");
   std::shared_ptr<Listener> listener_;
   Recorder<Accepted> accepted_;
 };
 
-// A client connection to `serviceName`, resumed, with its events recorded.
+// A resumed client connection with its events recorded; cancelled at the end.
 struct Client {
   explicit Client(const std::string& serviceName);
   ~Client();
-  // Sends and waits for the reply (or error).
-  Reply request(tn::Value body);
+  Reply request(tn::Value body);  // sends and waits for the reply or error
 
-  std::shared_ptr<tn::dispatch::SerialQueue> queue;
   std::shared_ptr<Connection> connection;
   EventRecorder events;
 };
 
-// A plain Unix socket connected to a service, for raw bytes.
+// Frames with any header values; the body may be any CBOR (or none).
+tn::Bytes rawFrameWithBody(uint64_t id, uint64_t replyTo, const tn::Bytes& body);
+tn::Bytes rawFrame(uint64_t id, uint64_t replyTo, const tn::Value& body);
+// A map body nesting `depth` maps in total ({"k": {"k": ...}}).
+tn::Bytes nestedBody(int depth);
+tn::Value numbered(uint64_t n);  // {"n": n}
+
+// A plain Unix socket connected to a socket path, for raw bytes.
 class RawClient {
  public:
-  explicit RawClient(const std::string& serviceName);
+  explicit RawClient(const std::string& socketPath);
   bool connected() const { return fd_.valid(); }
-  int fd() const { return fd_.get(); }
-  // Writes all of `bytes` (blocking).
   void write(const tn::Bytes& bytes);
-  // The next frame, or none at end of stream, on error or after kPatience.
+  // The next frame; none at end of stream or after kPatience.
   std::optional<RawFrame> readFrame();
-  // True when the peer closes the connection within kPatience; frames that
-  // arrive before are discarded.
+  // True when the peer closes within kPatience (frames before are skipped).
   bool waitForClose();
+  void close() { fd_.reset(); }
 
  private:
   bool readExactly(uint8_t* out, std::size_t size);

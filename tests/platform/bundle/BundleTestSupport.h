@@ -55,7 +55,7 @@ inline void makeDirectory(const std::string& path, mode_t mode = 0755) {
 inline void writeFile(const std::string& path, std::string_view contents, mode_t mode = 0644) {
   const std::filesystem::path parent = std::filesystem::path(path).parent_path();
   if (!std::filesystem::exists(parent)) makeDirectory(parent.string());
-  std::ofstream(path, std::ios::binary | std::ios::trunc) << contents;
+  std::ofstream(path, std::ofstream::binary | std::ofstream::trunc) << contents;
   ASSERT_EQ(::chmod(path.c_str(), mode), 0) << path;
 }
 

@@ -121,10 +121,10 @@ TEST_F(Notify, FilesAndDirectoriesGetTheirModesWhateverTheUmask) {
 
 TEST_F(Notify, FileWithoutACounterStartsOver) {
   ASSERT_TRUE(post(kName));
-  std::ofstream(fileOf(kName), std::ios::trunc) << "garbage\n";
+  std::ofstream(fileOf(kName), std::ofstream::trunc) << "garbage\n";
   EXPECT_EQ(*postCount(kName), 0U);
   EXPECT_EQ(*post(kName), 1U);
-  std::ofstream(fileOf(kName), std::ios::trunc) << "99999999999999999999999\n";  // beyond 64 bits
+  std::ofstream(fileOf(kName), std::ofstream::trunc) << "99999999999999999999999\n";  // beyond 64 bits
   EXPECT_EQ(*postCount(kName), 0U);
 }
 

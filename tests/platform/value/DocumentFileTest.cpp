@@ -27,7 +27,7 @@ class DocumentFile : public ::testing::Test {
 
   std::string write(const std::string& name, const std::string& contents) {
     const fs::path path = dir_ / name;
-    std::ofstream(path, std::ios::binary) << contents;
+    std::ofstream(path, std::ofstream::binary) << contents;
     return path.string();
   }
 

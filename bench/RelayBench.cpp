@@ -7,11 +7,23 @@
 // once; the ratio of the two is the relay's overhead. BM_RelayThroughput
 // keeps `depth` requests in flight on each of 32 connections.
 //
+// BM_DaemonClientRoundTrip is the same round trip made through
+// TNDaemonClient, the library hosts use (a "find" request, its logging
+// checks, the client's reply queue), against the same replying listener;
+// BM_DaemonClientToTenond makes it against a real tenond started for the
+// run (the daemon's envelope checks and dispatch included). Both belong
+// next to BM_RawSocketEcho of the same run: the target is a round trip
+// within 1.5 times the echo.
+//
 // Sockets live under a private TENON_ROOT made for the run.
 
 #include <benchmark/benchmark.h>
 
+#include <fcntl.h>
+#include <signal.h>
+#include <spawn.h>
 #include <sys/socket.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -23,11 +35,17 @@
 #include <thread>
 #include <vector>
 
+#include "libtenon/client/BlockingReply.h"
+#include "libtenon/client/TNDaemonClient.h"
 #include "platform/dispatch/Semaphore.h"
 #include "platform/dispatch/SerialQueue.h"
+#include "platform/log/Output.h"
+#include "platform/log/Sink.h"
 #include "platform/relay/Connection.h"
 #include "platform/relay/Frame.h"
 #include "platform/relay/Listener.h"
+
+extern char** environ;
 
 namespace relay {
 namespace {
@@ -164,6 +182,66 @@ void BM_RelayThroughput(benchmark::State& state) {
   state.SetItemsProcessed(state.iterations() * kConnections * depth);
 }
 BENCHMARK(BM_RelayThroughput)->Arg(1)->Arg(16)->UseRealTime();
+
+// Drops every record. The lookups log a line each at default level: its
+// formatting stays in the measurement, the terminal it would scroll does not.
+class DiscardingSink : public tn::log::Sink {
+ public:
+  void write(const tn::log::Record&) override {}
+};
+
+// One "find" through the client library, waiting for each reply.
+void roundTripsThroughClient(benchmark::State& state, const std::string& service) {
+  static const auto previous = tn::log::setSink(std::make_shared<DiscardingSink>());
+  tn::TNDaemonClient client(service);
+  const tn::UUID uuid = tn::UUID::random();
+  for (auto _ : state) {
+    tn::BlockingReply pending;
+    client.findPlugInByUUID(uuid, pending.block());
+    if (!pending.wait(std::chrono::seconds(10)).ok()) std::abort();
+  }
+}
+
+void BM_DaemonClientRoundTrip(benchmark::State& state) {
+  static ReplyingServer server("bench.client");
+  roundTripsThroughClient(state, "bench.client");
+}
+BENCHMARK(BM_DaemonClientRoundTrip)->UseRealTime();
+
+// The daemon binary beside this build, started under the private root with
+// its log silenced; stopped with SIGTERM at exit.
+class TenondForBench {
+ public:
+  explicit TenondForBench(const std::string& service) {
+    usePrivateRoot();
+    std::string binary = std::string(TENON_BINARY_DIR) + "/tenond/tenond";
+    std::string option = "-S";
+    std::string name = service;
+    char* argv[] = {binary.data(), option.data(), name.data(), nullptr};
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
+    if (posix_spawn(&pid_, binary.c_str(), &actions, nullptr, argv, environ) != 0) std::abort();
+    posix_spawn_file_actions_destroy(&actions);
+    for (int attempt = 0; !Connection::connectToService(service, SerialQueue::create("bench.probe")).ok(); ++attempt) {
+      if (attempt == 500) std::abort();
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+  }
+  ~TenondForBench() {
+    ::kill(pid_, SIGTERM);
+    ::waitpid(pid_, nullptr, 0);
+  }
+
+ private:
+  pid_t pid_ = -1;
+};
+
+void BM_DaemonClientToTenond(benchmark::State& state) {
+  static TenondForBench daemon("bench.tenond");
+  roundTripsThroughClient(state, "bench.tenond");
+}
+BENCHMARK(BM_DaemonClientToTenond)->UseRealTime();
 
 }  // namespace
 }  // namespace relay

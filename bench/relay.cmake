@@ -1,3 +1,6 @@
 # The relay: a request's round trip against a raw socket echo of the same
-# bytes, and throughput over 32 connections.
-tenon_benchmark(relay_bench SOURCES RelayBench.cpp LIBS tn_relay)
+# bytes, the same through the client library (to a listener in the process
+# and to a real tenond), and throughput over 32 connections.
+tenon_benchmark(relay_bench SOURCES RelayBench.cpp LIBS tn_client tn_relay)
+target_compile_definitions(relay_bench PRIVATE TENON_BINARY_DIR="${PROJECT_BINARY_DIR}")
+add_dependencies(relay_bench tenond)

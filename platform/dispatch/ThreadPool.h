@@ -21,6 +21,7 @@
 
 #pragma once
 
+#include <atomic>
 #include <condition_variable>
 #include <cstddef>
 #include <deque>
@@ -98,6 +99,10 @@ class ThreadPool final : public QueueTarget {
   using WorkerList = std::list<Worker>;
 
   void workerMain(WorkerList::iterator self);
+  // An idle worker's short wait for new work without sleeping (see
+  // kIdleSpin). Needs mutex_ held through `lock`; releases it while
+  // polling. True when a task is queued on return.
+  bool spinForWork(std::unique_lock<std::mutex>& lock);
   // Starts a worker when the pending tasks outnumber the idle workers, fewer
   // than base_ workers are running and the cap allows it. Needs mutex_ held.
   void growIfNeededLocked();
@@ -119,6 +124,8 @@ class ThreadPool final : public QueueTarget {
   WorkerList workers_;
   std::size_t threads_ = 0;
   std::size_t idle_ = 0;
+  std::size_t spinning_ = 0;  // idle workers polling queued_ instead of sleeping
+  std::atomic<std::size_t> queued_{0};  // tasks_.size(), readable without mutex_
   std::size_t blocked_ = 0;
   bool stopping_ = false;    // destructor: run what is queued, then exit
   bool abandoning_ = false;  // process exit: start nothing more, exit

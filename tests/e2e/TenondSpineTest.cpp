@@ -14,13 +14,30 @@
 #include "platform/relay/Connection.h"
 #include "platform/relay/ServicePath.h"
 #include "platform/value/Cbor.h"
-#include "tests/e2e/TenondProcess.h"
+#include "platform/notify/Post.h"
+#include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
 
 namespace tn::test {
 namespace {
 
-const std::string kTenond = std::string(TENON_BINARY_DIR) + "/tenond/tenond";
+const std::string kTenond = tenondBinaryPath();
+
+// The daemon under test. This process's own connections look for its
+// service under the daemon's root.
+class TenondProcess : public DaemonProcess {
+ public:
+  explicit TenondProcess(std::vector<std::string> arguments = {}) : DaemonProcess(kTenond, std::move(arguments)) {
+    setenv("TENON_ROOT", root().c_str(), 1);
+  }
+};
+
+// How often the annotation-change notification was posted under `root`.
+uint64_t annotationChangeCount(const std::string& root) {
+  setenv("TENON_ROOT", root.c_str(), 1);
+  auto count = notify::postCount("com.ostrel.tenon.annotation-change");
+  return count ? *count : 0;
+}
 
 // A connection to the daemon that waits for each reply.
 class Client {

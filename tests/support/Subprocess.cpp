@@ -55,8 +55,16 @@ ProcessResult runProcess(const std::vector<std::string>& argv, const std::vector
   std::vector<char*> args;
   for (const auto& a : argv) args.push_back(const_cast<char*>(a.c_str()));
   args.push_back(nullptr);
+  // The extra entries replace inherited ones of the same name.
+  auto overridden = [&](const std::string& entry) {
+    const std::string name = entry.substr(0, entry.find('=') + 1);
+    for (const auto& extra : extraEnvironment)
+      if (extra.starts_with(name)) return true;
+    return false;
+  };
   std::vector<std::string> envStrings;
-  for (char** e = environ; *e; ++e) envStrings.emplace_back(*e);
+  for (char** e = environ; *e; ++e)
+    if (!overridden(*e)) envStrings.emplace_back(*e);
   envStrings.insert(envStrings.end(), extraEnvironment.begin(), extraEnvironment.end());
   std::vector<char*> env;
   for (auto& e : envStrings) env.push_back(e.data());

@@ -1,16 +1,21 @@
 #pragma once
 
-// tools/tnctl: the command-line tool of Tenon. Each subcommand lives in its
-// own file and registers itself on the application with an add…Command
-// function; main.cpp only assembles them.
+// tools/tnctl: the command-line tool of Tenon. Each subcommand (or group of
+// related ones) lives in its own file and registers itself on the
+// application with an add…Command(s) function; main.cpp only assembles them.
+
+#include <string>
 
 #include <CLI/CLI.hpp>
 
 namespace tnctl {
 
-// Options every subcommand shares.
+// Options every subcommand shares. Filled in by parsing; subcommand
+// callbacks read them when they run, after parsing.
 struct GlobalOptions {
-  bool json = false;  // machine-readable output
+  bool json = false;                                     // machine-readable output
+  std::string service = "com.ostrel.tenon.tenond";       // the daemon's relay service
+  unsigned timeoutSeconds = 30;                          // how long to wait for a reply
 };
 
 // Subcommand callbacks report failure by throwing CommandFailed after they
@@ -23,5 +28,13 @@ struct CommandFailed {
 [[noreturn]] void fail(const std::string& message);
 
 void addDocumentCommand(CLI::App& app, const GlobalOptions& options);
+
+// Subcommands that talk to tenond, one per client operation.
+void addRegistrationCommands(CLI::App& app, const GlobalOptions& options);  // add, remove, bulk
+void addLookupCommands(CLI::App& app, const GlobalOptions& options);        // find, match
+void addReadinessCommands(CLI::App& app, const GlobalOptions& options);     // ready, access
+void addAnnotationCommands(CLI::App& app, const GlobalOptions& options);    // annotate, bulk-annotate
+void addHoldCommands(CLI::App& app, const GlobalOptions& options);          // hold, release
+void addRequestCommand(CLI::App& app, const GlobalOptions& options);        // request (raw)
 
 }  // namespace tnctl

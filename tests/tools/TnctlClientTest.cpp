@@ -250,12 +250,23 @@ TEST(PythonTypedEncoding, DecodesFormsAsTheDaemonEncodesThem) {
   for (uint8_t byte : *encoded.data()) hex += fmt::format("{:02x}", byte);
   const std::string script =
       "import sys; sys.path.insert(0, sys.argv[1]); import tenon_client as t; "
-      "print(t.to_json(t.decode_typed(bytes.fromhex(sys.argv[2]))))";
+      "form = t.decode_typed(bytes.fromhex(sys.argv[2])); "
+      "print(t.to_json({'values': form, 'kinds': {k: type(v).__name__ for k, v in form.items()}}))";
   const auto result = test::runProcess(
       {kPython, "-c", script, std::string(TENON_SOURCE_DIR) + "/examples/python", hex});
   ASSERT_EQ(result.exitStatus, 0) << result.err;
-  auto decoded = readDocument(result.out, "stdout", DocumentEncoding::Json);
-  ASSERT_TRUE(decoded) << result.out;
+  auto output = readDocument(result.out, "stdout", DocumentEncoding::Json);
+  ASSERT_TRUE(output) << result.out;
+  // Python's own kinds: integers (signed or not) as int, the UUID tag as
+  // uuid.UUID, dates as datetime, data as bytes.
+  const Value& kinds = (*output)["kinds"];
+  EXPECT_EQ(kinds["lastmodified"], Value("int"));
+  EXPECT_EQ(kinds["hubProtocolVersion"], Value("int"));
+  EXPECT_EQ(kinds["offset"], Value("int"));
+  EXPECT_EQ(kinds["token"], Value("UUID"));
+  EXPECT_EQ(kinds["created"], Value("datetime"));
+  EXPECT_EQ(kinds["hash"], Value("bytes"));
+  const Value* decoded = &(*output)["values"];
   EXPECT_EQ((*decoded)["identifier"], Value("com.example.filter"));
   EXPECT_EQ((*decoded)["lastmodified"], Value(1700000000));
   EXPECT_EQ((*decoded)["hubProtocolVersion"], Value(2));

@@ -1,13 +1,8 @@
 #include "platform/notify/Observer.h"
 
-#include <poll.h>
-#include <sys/eventfd.h>
-#include <sys/inotify.h>
-#include <unistd.h>
-
 #include <algorithm>
-#include <cerrno>
-#include <cstring>
+#include <mutex>
+#include <optional>
 
 #include <fmt/format.h>
 
@@ -16,16 +11,42 @@
 #include "platform/notify/Post.h"
 
 namespace notify {
-namespace {
 
-constexpr uint32_t kWatchMask = IN_MODIFY | IN_CLOSE_WRITE | IN_CREATE | IN_DELETE | IN_MOVED_FROM |
-                                IN_MOVED_TO | IN_DELETE_SELF | IN_ONLYDIR;
+struct Observer::Delivery : std::enable_shared_from_this<Delivery> {
+  Delivery(std::string notificationName, std::shared_ptr<tn::dispatch::SerialQueue> handlerQueue,
+           std::function<void()> handlerBlock)
+      : name(std::move(notificationName)), queue(std::move(handlerQueue)), handler(std::move(handlerBlock)) {}
 
-tn::Error systemError(std::string_view what, int error) {
-  return notifyError(NotifyErrorCode::FileSystem, fmt::format("{}: {}", what, std::strerror(error)));
-}
+  // Runs on the watch thread: queues one handler call per post made since
+  // the count was last read.
+  void deliverNewPosts() {
+    const tn::Result<uint64_t> count = postCount(name);
+    if (!count) {
+      TN_LOG_ERROR(tn::log::ops(), "notification observer for {}: {}", name, count.error().description());
+      return;
+    }
+    uint64_t pending = 0;
+    {
+      const std::lock_guard lock(mutex);
+      if (!seen) return;  // create() has not read the starting count yet
+      if (*count < *seen) seen = 0;  // the file was removed and started over
+      pending = std::min(*count - *seen, kMaxBurst);
+      seen = *count;
+    }
+    for (uint64_t i = 0; i < pending; ++i) {
+      queue->async([self = shared_from_this()] {
+        if (!self->cancelled.load()) self->handler();
+      });
+    }
+  }
 
-}  // namespace
+  const std::string name;
+  const std::shared_ptr<tn::dispatch::SerialQueue> queue;
+  const std::function<void()> handler;
+  std::atomic<bool> cancelled{false};
+  std::mutex mutex;
+  std::optional<uint64_t> seen;  // guarded by mutex: the count handled so far
+};
 
 tn::Result<std::unique_ptr<Observer>> Observer::create(std::string_view name,
                                                        std::shared_ptr<tn::dispatch::SerialQueue> queue,
@@ -36,108 +57,36 @@ tn::Result<std::unique_ptr<Observer>> Observer::create(std::string_view name,
   }
   if (tn::Result<void> created = createNotificationDirectory(); !created) return created.error();
 
-  const int inotify = ::inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
-  if (inotify < 0) return systemError("cannot create an inotify instance", errno);
-  const std::string directory = notificationDirectory();
-  if (::inotify_add_watch(inotify, directory.c_str(), kWatchMask) < 0) {
-    const int error = errno;
-    ::close(inotify);
-    return systemError(fmt::format("{}: cannot watch", directory), error);
-  }
+  auto delivery = std::make_shared<Delivery>(std::string(name), queue, std::move(handler));
+  auto watch = DirectoryWatch::create(notificationDirectory(), [delivery](const DirectoryChanges& changes) {
+    if (changes.touches(delivery->name) || changes.directoryGone) delivery->deliverNewPosts();
+    if (changes.directoryGone) {
+      TN_LOG_ERROR(tn::log::ops(), "notification observer for {} stopped: {} is gone", delivery->name,
+                   notificationDirectory());
+    }
+  });
+  if (!watch) return watch.error();
   // The count is read after the watch is in place, so no post falls between.
   tn::Result<uint64_t> count = postCount(name);
-  if (!count) {
-    ::close(inotify);
-    return count.error();
+  if (!count) return count.error();
+  {
+    const std::lock_guard lock(delivery->mutex);
+    delivery->seen = *count;
   }
-  const int wakeup = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-  if (wakeup < 0) {
-    const int error = errno;
-    ::close(inotify);
-    return systemError("cannot create an eventfd", error);
-  }
-  return std::make_unique<Observer>(CreateTag(), std::string(name), std::move(queue), std::move(handler),
-                                    inotify, wakeup, *count);
+  return std::make_unique<Observer>(CreateTag(), std::string(name), std::move(queue), std::move(delivery),
+                                    std::move(*watch));
 }
 
 Observer::Observer(CreateTag, std::string name, std::shared_ptr<tn::dispatch::SerialQueue> queue,
-                   std::function<void()> handler, int inotify, int wakeup, uint64_t count)
-    : name_(std::move(name)),
-      queue_(std::move(queue)),
-      delivery_(std::make_shared<Delivery>()),
-      inotify_(inotify),
-      wakeup_(wakeup),
-      seen_(count) {
-  delivery_->handler = std::move(handler);
-  thread_ = std::thread([this] { watch(); });
-}
+                   std::shared_ptr<Delivery> delivery, std::unique_ptr<DirectoryWatch> watch)
+    : name_(std::move(name)), queue_(std::move(queue)), delivery_(std::move(delivery)), watch_(std::move(watch)) {}
 
 Observer::~Observer() {
-  const uint64_t one = 1;
-  while (::write(wakeup_, &one, sizeof one) < 0 && errno == EINTR) {
-  }
-  thread_.join();
+  watch_.reset();  // no more calls get queued
   delivery_->cancelled.store(true);
   // Blocks queued before this point now skip the handler; wait for one that
   // may be running it, unless that is our caller.
   if (!queue_->isCurrent()) queue_->sync([] {});
-  ::close(inotify_);
-  ::close(wakeup_);
-}
-
-void Observer::watch() {
-  pollfd fds[2] = {{inotify_, POLLIN, 0}, {wakeup_, POLLIN, 0}};
-  for (;;) {
-    if (::poll(fds, 2, -1) < 0) {
-      if (errno == EINTR) continue;
-      TN_LOG_ERROR(tn::log::ops(), "notification observer for {} stopped: poll: {}", name_, std::strerror(errno));
-      return;
-    }
-    if (fds[1].revents != 0) return;
-    if (fds[0].revents != 0 && !drainEvents()) {
-      TN_LOG_ERROR(tn::log::ops(), "notification observer for {} stopped: {} is gone", name_,
-                   notificationDirectory());
-      return;
-    }
-  }
-}
-
-bool Observer::drainEvents() {
-  alignas(inotify_event) char buffer[16 * 1024];
-  bool changed = false;
-  bool watchGone = false;
-  for (;;) {
-    const ssize_t n = ::read(inotify_, buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) break;
-    for (size_t offset = 0; offset < static_cast<size_t>(n);) {
-      inotify_event event;
-      std::memcpy(&event, buffer + offset, sizeof event);
-      const char* eventName = buffer + offset + sizeof event;
-      if ((event.mask & IN_Q_OVERFLOW) != 0) changed = true;
-      if ((event.mask & (IN_IGNORED | IN_DELETE_SELF)) != 0) watchGone = true;
-      if (event.len > 0 && name_ == std::string_view(eventName, ::strnlen(eventName, event.len))) changed = true;
-      offset += sizeof event + event.len;
-    }
-  }
-  if (changed || watchGone) deliverNewPosts();
-  return !watchGone;
-}
-
-void Observer::deliverNewPosts() {
-  const tn::Result<uint64_t> count = postCount(name_);
-  if (!count) {
-    TN_LOG_ERROR(tn::log::ops(), "notification observer for {}: {}", name_, count.error().description());
-    return;
-  }
-  if (*count < seen_) seen_ = 0;  // the file was removed and started over
-  const uint64_t pending = std::min(*count - seen_, kMaxBurst);
-  seen_ = *count;
-  for (uint64_t i = 0; i < pending; ++i) {
-    queue_->async([delivery = delivery_] {
-      if (!delivery->cancelled.load()) delivery->handler();
-    });
-  }
 }
 
 }  // namespace notify

@@ -6,8 +6,8 @@
 //   auto observer = notify::Observer::create("com.ostrel.tenon.changed", queue,
 //                                            [] { reload(); });
 //
-// Each observer has its own inotify descriptor and one thread that waits on
-// it and queues the handler calls; the handler itself runs on the queue.
+// Each observer has its own DirectoryWatch of the notification directory,
+// whose thread queues the handler calls; the handler itself runs on the queue.
 // Posts are never coalesced: when the count grew by three since the observer
 // last looked, three calls are queued. A count that goes down (the file was
 // removed and posted again) starts over from zero. At most kMaxBurst calls
@@ -21,9 +21,9 @@
 #include <memory>
 #include <string>
 #include <string_view>
-#include <thread>
 
 #include "platform/dispatch/SerialQueue.h"
+#include "platform/notify/DirectoryWatch.h"
 #include "platform/value/Result.h"
 
 namespace notify {
@@ -54,28 +54,17 @@ class Observer {
 
   const std::string& name() const { return name_; }
 
-  // Takes ownership of both descriptors. Use create().
+  // What the watch thread and the queued blocks share with the observer.
+  struct Delivery;
+
   Observer(CreateTag, std::string name, std::shared_ptr<tn::dispatch::SerialQueue> queue,
-           std::function<void()> handler, int inotify, int wakeup, uint64_t count);
+           std::shared_ptr<Delivery> delivery, std::unique_ptr<DirectoryWatch> watch);
 
  private:
-  // What queued blocks share with the observer.
-  struct Delivery {
-    std::function<void()> handler;
-    std::atomic<bool> cancelled{false};
-  };
-
-  void watch();             // the thread's loop
-  bool drainEvents();       // false when the watch is gone
-  void deliverNewPosts();
-
   const std::string name_;
   const std::shared_ptr<tn::dispatch::SerialQueue> queue_;
   const std::shared_ptr<Delivery> delivery_;
-  const int inotify_;
-  const int wakeup_;        // an eventfd the destructor signals
-  uint64_t seen_;           // the count handled so far; the thread's own
-  std::thread thread_;
+  std::unique_ptr<DirectoryWatch> watch_;
 };
 
 }  // namespace notify

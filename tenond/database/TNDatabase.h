@@ -1,56 +1,145 @@
 #pragma once
 
-// tenond/database: the daemon's view of the installed plug-ins.
+// TNDatabase: the daemon's view of the installed plug-ins.
 //
-// TNDatabase will hold the plug-in cache over the registrar, the annotation
-// store and the registrar observer. Until those land it is the smallest base
-// the server needs: the annotation file location, the delegate told about
-// removed plug-ins, and the cache limit.
+// The registrar (platform/registrar) is the authority on what is installed.
+// The database asks it for records, turns each into a TNDPlugIn and keeps
+// those in a cache keyed by UUID, so repeated requests reuse one object. It
+// also owns the annotation store, forwards bundle registration to the
+// registrar, follows its install and uninstall batches, and empties the
+// cache when the user's locale changes.
+//
+// Queues: the cache and every use of the annotation store belong to the
+// serial queue "TNDatabase". Lookups and the annotation wrappers enter it
+// synchronously (so they must not be called from a task already on it);
+// createPlugInForProxy, purgeCachesToLimit and autoElect run only on it.
+// Registration, path and application lookups run on the caller's thread.
+//
+// The purge policy is all-or-nothing: an insertion that finds more than
+// cacheLimit entries empties the cache (and the registrar's schema caches)
+// first, so the cache never holds more than cacheLimit + 1 plug-ins.
 
 #include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
+#include <unordered_map>
 #include <vector>
+
+#include "libtenon/registrar/RegistrarLookup.h"
+#include "platform/dispatch/SerialQueue.h"
+#include "platform/locale/Locale.h"
+#include "platform/registrar/Registrar.h"
+#include "platform/value/Error.h"
+#include "platform/value/URL.h"
+#include "platform/value/UUID.h"
+#include "tenond/database/TNDAnnotationStore.h"
+#include "tenond/plugin/TNDPlugIn.h"
 
 namespace tnd {
 
-// Told about plug-ins that are about to be uninstalled.
+// Told about plug-ins that the registrar is about to uninstall, after the
+// cache has let go of them and outside the database queue.
 class TNDatabaseDelegate {
  public:
   virtual ~TNDatabaseDelegate() = default;
-  // `identifiers` name the plug-ins (bundle identifiers) being removed.
-  virtual void removedPlugIns(const std::vector<std::string>& identifiers) = 0;
+  virtual void removedPlugIns(const registrar::PlugInList& records) = 0;
 };
 
 class TNDatabase {
  public:
-  virtual ~TNDatabase() = default;
+  // The auto-elect entitlement (Part of the install events).
+  static constexpr const char* kAutoElectEntitlement = "com.ostrel.developer.auto-elect-plugin";
+  static constexpr const char* kAnnotationChangeNotification = "com.ostrel.tenon.annotation-change";
 
-  // The annotation file: the -d path as given, else the default location
-  // $TENON_ROOT/var/db/Tenon-Annotations.
-  const std::string& annotationsPath() const { return annotationsPath_; }
-  static std::string defaultDatabasePath();
+  virtual ~TNDatabase();
+  TNDatabase(const TNDatabase&) = delete;
+  TNDatabase& operator=(const TNDatabase&) = delete;
 
-  std::weak_ptr<TNDatabaseDelegate> delegate() const { return delegate_; }
-  void setDelegate(std::weak_ptr<TNDatabaseDelegate> delegate) { delegate_ = std::move(delegate); }
+  // --- Lookups ---
 
-  uint32_t cacheLimit() const { return cacheLimit_; }
-  void setCacheLimit(uint32_t limit) { cacheLimit_ = limit; }
+  // The cached plug-in for the record's UUID, or one built from the record.
+  std::shared_ptr<TNDPlugIn> plugInForProxy(const registrar::PlugInPtr& record);
+  // The cached plug-in, or one built from the registrar's record of the
+  // UUID; none (logged) when the registrar does not know it.
+  std::shared_ptr<TNDPlugIn> findPlugIn(const tn::UUID& uuid);
+  // findPlugIn of the UUID the registrar reports for the bundle at `url`;
+  // none (logged) when it knows no plug-in there.
+  std::shared_ptr<TNDPlugIn> findPlugInAtPath(const tn::URL& url);
+  // The usable plug-ins of the application at `url`, in the registrar's
+  // order; none when it has no plug-ins (or is unknown).
+  std::optional<std::vector<std::shared_ptr<TNDPlugIn>>> plugInsWithinApplication(const tn::URL& url);
+
+  // --- Registration (the registrar's) ---
+
+  // None on success; else Tenon error 2 "Registrar failed to register the
+  // plug-in" (the registrar's reason is logged).
+  std::optional<tn::Error> addPlugIn(const tn::URL& url);
+  // None on success; else Tenon error 2 "Registrar failed to deregister the
+  // plug-in".
+  std::optional<tn::Error> removePlugIn(const tn::URL& url);
+
+  // --- Annotations ---
+
+  std::optional<tn::Dictionary> annotationForPlugIn(const TNDPlugIn& plugIn);
+  // Merges (or with none removes) the plug-in's annotation and saves the
+  // file. Never fails the caller; does not post the change notification.
+  void setAnnotation(const std::optional<tn::Dictionary>& annotation, const TNDPlugIn& plugIn);
+  // Posts "com.ostrel.tenon.annotation-change".
+  void notifyAnnotationChange();
+  // On the database queue: elects a plug-in that carries the auto-elect
+  // entitlement unless a non-zero election is stored.
+  void autoElect(const TNDPlugIn& plugIn);
+
+  // --- Install events (registrar observer callbacks) ---
+
+  void pluginsDidInstall(const registrar::PlugInList& records);
+  void pluginsWillUninstall(const registrar::PlugInList& records);
+
+  // --- Properties ---
+
+  uint32_t cacheLimit() const { return cacheLimit_.load(); }
+  void setCacheLimit(uint32_t limit) { cacheLimit_.store(limit); }
+  std::weak_ptr<TNDatabaseDelegate> delegate() const;
+  void setDelegate(std::weak_ptr<TNDatabaseDelegate> delegate);
+  const std::string& annotationsPath() const { return annotations_->annotationsPath(); }
+  const std::shared_ptr<registrar::Registrar>& workspace() const { return workspace_; }
+  const std::shared_ptr<tn::dispatch::SerialQueue>& databaseQueue() const { return sync_; }
+  const tn::TNRegistryLookup& registryLookup() const { return *lookup_; }
+  // The number of cached plug-ins (read on the database queue).
+  size_t cacheCount();
 
  protected:
-  TNDatabase() = default;
+  TNDatabase();
 
-  // The base initialiser. Takes the -d path unchanged (none for the default
-  // location). Fails, logging why, when the directory that is to hold the
-  // annotation file does not exist and cannot be created: the store could
-  // never be saved there.
-  bool initWithDatabase(const std::optional<std::string>& path);
+  // Opens the registrar of $TENON_ROOT (read-write, scanning the roots and
+  // watching them), creates the annotation store with `path` (none: the
+  // default location), registers as the registrar's observer and for
+  // locale changes on `localeQueue` (the main queue in the daemon). False
+  // (logged) when the registrar cannot be opened or the annotation file's
+  // directory cannot be made.
+  bool initWithDatabase(const std::optional<std::string>& path,
+                        std::shared_ptr<tn::dispatch::SerialQueue> localeQueue);
 
  private:
-  std::string annotationsPath_;
-  std::weak_ptr<TNDatabaseDelegate> delegate_;
-  uint32_t cacheLimit_ = 0;
+  class RegistrarObserver;
+
+  // On the database queue.
+  std::shared_ptr<TNDPlugIn> createPlugInForProxy(const registrar::PlugInPtr& record);
+  void purgeCachesToLimit(uint32_t limit);
+  std::shared_ptr<TNDPlugIn> cachedPlugIn(const tn::UUID& uuid);
+  void localeChanged(const std::string& locale);
+
+  std::shared_ptr<registrar::Registrar> workspace_;
+  std::unique_ptr<tn::RegistrarLookup> lookup_;
+  std::unique_ptr<TNDAnnotationStore> annotations_;  // used on sync_ only
+  std::unordered_map<tn::UUID, std::shared_ptr<TNDPlugIn>> cache_;  // sync_ only
+  std::shared_ptr<tn::dispatch::SerialQueue> sync_;
+  std::shared_ptr<RegistrarObserver> observer_;
+  std::unique_ptr<locale::LocaleWatcher> regionObserver_;
+  std::atomic<uint32_t> cacheLimit_{0};
+  mutable std::mutex delegateMutex_;
+  std::weak_ptr<TNDatabaseDelegate> delegate_;  // guarded by delegateMutex_
 };
 
 }  // namespace tnd

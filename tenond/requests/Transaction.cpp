@@ -15,8 +15,8 @@ namespace tnd {
 // whose operations the daemon does not serve yet answer "unrecognized
 // request" until they do.
 const Transaction::Route Transaction::kRoutes[] = {
-    {"add", &Transaction::unrecognized},   {"remove", &Transaction::unrecognized},
-    {"bulk", &Transaction::unrecognized},  {"match", &Transaction::unrecognized},
+    {"add", &Transaction::addPlugIns},     {"remove", &Transaction::removePlugIns},
+    {"bulk", &Transaction::bulkPlugIns},   {"match", &Transaction::unrecognized},
     {"ready", &Transaction::unrecognized}, {"access", &Transaction::unrecognized},
     {"annotate", &Transaction::unrecognized}, {"bulk-annotate", &Transaction::unrecognized},
     {"lock", &Transaction::unrecognized},  {"find", &Transaction::unrecognized},

@@ -80,6 +80,11 @@ class Transaction {
   void route(const std::string* type);
   void unrecognized();
 
+  // Registration requests (RegistrationRequests.cpp).
+  void addPlugIns();
+  void removePlugIns();
+  void bulkPlugIns();
+
   const std::shared_ptr<TNDRelayClient> client_;
   const relay::Message request_;
   tn::Dictionary reply_;

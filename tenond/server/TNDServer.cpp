@@ -21,7 +21,7 @@ std::shared_ptr<TNDServer> gServer;  // the process's one server
 std::shared_ptr<TNDServer> TNDServer::initForService(const std::string& serviceName,
                                                      const std::optional<std::string>& databasePath) {
   std::shared_ptr<TNDServer> server(new TNDServer());
-  if (!server->initWithDatabase(databasePath)) return nullptr;
+  if (!server->initWithDatabase(databasePath, tn::dispatch::mainQueue())) return nullptr;
 
   server->relayQueue_ = tn::dispatch::SerialQueue::create("relay");
   server->mainQueue_ = tn::dispatch::SerialQueue::create("service", kServiceQualityOfService);
@@ -74,14 +74,8 @@ void TNDServer::stop() {
     for (const auto& hold : holds_)
       TN_LOG_DEBUG(tn::log::ops(), "releasing plug-in hold {} because server is stopping", hold->uuid().string());
     holds_.clear();
-    postAnnotationChange();
+    notifyAnnotationChange();
   });
-}
-
-void TNDServer::postAnnotationChange() {
-  if (auto posted = notify::post(kAnnotationChangeNotification); !posted)
-    TN_LOG_ERROR(tn::log::ops(), "cannot post {}: {}", kAnnotationChangeNotification,
-                 posted.error().localizedDescription());
 }
 
 bool TNDServer::holdOnPlugIn(const tn::UUID& plugIn) {
@@ -94,7 +88,7 @@ bool TNDServer::holdOnPlugIn(const tn::UUID& plugIn) {
 
 void TNDServer::addHold(std::shared_ptr<TNDPlugInHold> hold) {
   syncQueue_->sync([&] { holds_.push_back(std::move(hold)); });
-  postAnnotationChange();
+  notifyAnnotationChange();
 }
 
 void TNDServer::unholdToken(const tn::UUID& token) {
@@ -103,7 +97,7 @@ void TNDServer::unholdToken(const tn::UUID& token) {
       if ((*it)->uuid() != token) continue;
       TN_LOG_DEBUG(tn::log::ops(), "releasing plug-in hold {} at client's request", token.string());
       holds_.erase(it);
-      postAnnotationChange();
+      notifyAnnotationChange();
       return;
     }
   });
@@ -117,7 +111,7 @@ void TNDServer::unholdClient(const std::shared_ptr<TNDRelayClient>& client) {
       TN_LOG_DEBUG(tn::log::ops(), "releasing plug-in hold {} for dead client pid {}", (*it)->uuid().string(),
                    client->pid());
       holds_.erase(it);
-      postAnnotationChange();
+      notifyAnnotationChange();
     }
   });
 }
@@ -126,9 +120,12 @@ size_t TNDServer::holdCount() {
   return syncQueue_->sync([&] { return holds_.size(); });
 }
 
-void TNDServer::removedPlugIns(const std::vector<std::string>& identifiers) {
-  for (const auto& identifier : identifiers)
-    TN_LOG_DEBUG(tn::log::ops(), "plug-in {} removed; terminating its instances is not available yet", identifier);
+void TNDServer::removedPlugIns(const registrar::PlugInList& records) {
+  // Forced termination of running instances comes with the holds' issue;
+  // until then an uninstall only leaves the cache.
+  for (const registrar::PlugInPtr& record : records)
+    TN_LOG_DEBUG(tn::log::ops(), "plug-in {} removed; terminating its instances is not available yet",
+                 record->identifier());
 }
 
 }  // namespace tnd

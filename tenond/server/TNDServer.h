@@ -30,7 +30,6 @@ namespace tnd {
 class TNDPlugInHold;
 class TNDRelayClient;
 
-inline constexpr const char* kAnnotationChangeNotification = "com.ostrel.tenon.annotation-change";
 inline constexpr int kServiceQualityOfService = 25;  // user-initiated
 
 class TNDServer final : public TNDatabase,
@@ -68,7 +67,7 @@ class TNDServer final : public TNDatabase,
 
   // TNDatabaseDelegate. Terminating the running instances of removed
   // plug-ins comes with the supervisor; for now the removal is logged.
-  void removedPlugIns(const std::vector<std::string>& identifiers) override;
+  void removedPlugIns(const registrar::PlugInList& records) override;
 
   uint32_t verbose() const { return verbose_; }
   void setVerbose(uint32_t verbose) { verbose_ = verbose; }
@@ -80,7 +79,6 @@ class TNDServer final : public TNDatabase,
  private:
   TNDServer() = default;
   void installListenerHandlers();
-  void postAnnotationChange();
 
   std::atomic<uint32_t> verbose_{0};
   std::shared_ptr<tn::dispatch::SerialQueue> relayQueue_;

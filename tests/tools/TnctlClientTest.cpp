@@ -63,13 +63,12 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
   const auto untyped = tnctl({"request", R"({"version":3})"});
   EXPECT_EQ(untyped.err, "tnctl: error 4: invalid request format (missing type)\n");
 
-  // The operations build well-formed requests; the daemon serves none of
-  // them yet.
+  // The operations build well-formed requests that the daemon understands
+  // (the ones it does not serve yet say so).
   for (std::vector<std::string> operation : std::vector<std::vector<std::string>>{
            {"match"},
            {"match", "--rules", R"({"XTExtensionPoint":"com.example.filter"})", "--flags", "0x1"},
            {"find", "--uuid", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"},
-           {"add", "/opt/A.tnx"},
            {"release", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"},
        }) {
     const auto result = tnctl(operation);
@@ -77,6 +76,8 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
     EXPECT_EQ(result.err, "tnctl: error 4: unrecognized request\n") << operation[0];
     EXPECT_EQ(result.out, "") << operation[0];
   }
+  const auto added = tnctl({"add", "/opt/A.tnx"});
+  EXPECT_EQ(added.err, "tnctl: error 9: invalid plugin path: /opt/A.tnx\n");
   // None of it disturbed the daemon: it still stops cleanly.
   EXPECT_EQ(daemon_.terminate(), 0) << daemon_.log();
 }

@@ -28,6 +28,8 @@ struct CommandFailed {
 [[noreturn]] void fail(const std::string& message);
 
 void addDocumentCommand(CLI::App& app, const GlobalOptions& options);
+void addLintCommand(CLI::App& app, const GlobalOptions& options);  // lint BUNDLE
+void addRegistryCommands(CLI::App& app, const GlobalOptions& options);  // registry list|show|scan
 
 // Subcommands that talk to tenond, one per client operation.
 void addRegistrationCommands(CLI::App& app, const GlobalOptions& options);  // add, remove, bulk

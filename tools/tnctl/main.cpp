@@ -32,6 +32,8 @@ int main(int argc, char** argv) {
   app.add_option("--timeout", options.timeoutSeconds, "Seconds to wait for tenond's reply")->capture_default_str();
 
   tnctl::addDocumentCommand(app, options);
+  tnctl::addRegistryCommands(app, options);
+  tnctl::addLintCommand(app, options);
   tnctl::addRegistrationCommands(app, options);
   tnctl::addLookupCommands(app, options);
   tnctl::addReadinessCommands(app, options);

@@ -91,7 +91,7 @@ class Server : public ::testing::Test {
     return *reply;
   }
 
-  static uint64_t annotationChanges() { return *notify::postCount(kAnnotationChangeNotification); }
+  static uint64_t annotationChanges() { return *notify::postCount(TNDatabase::kAnnotationChangeNotification); }
 
   template <typename Condition>
   static bool eventually(Condition condition) {

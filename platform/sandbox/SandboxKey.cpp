@@ -1,0 +1,147 @@
+#include "platform/sandbox/SandboxKey.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <map>
+#include <mutex>
+
+#include <fmt/format.h>
+#include <openssl/rand.h>
+
+namespace sandbox {
+namespace {
+
+tn::Error keyError(const std::string& path, std::string_view what, int error) {
+  return tn::Error(std::string(kSandboxErrorDomain), error, fmt::format("{}: {}: {}", path, what, std::strerror(error)));
+}
+
+struct CachedKey {
+  dev_t device = 0;
+  ino_t inode = 0;
+  SandboxKey key{};
+};
+
+// Keys already read, by path: issuing a token must not cost a file read.
+std::mutex cacheMutex;
+std::map<std::string, CachedKey> cache;  // guarded by cacheMutex
+
+std::optional<SandboxKey> cachedKey(const std::string& path, const struct stat& status) {
+  const std::lock_guard lock(cacheMutex);
+  const auto found = cache.find(path);
+  if (found == cache.end() || found->second.device != status.st_dev || found->second.inode != status.st_ino) {
+    return std::nullopt;
+  }
+  return found->second.key;
+}
+
+void rememberKey(const std::string& path, const struct stat& status, const SandboxKey& key) {
+  const std::lock_guard lock(cacheMutex);
+  cache[path] = CachedKey{status.st_dev, status.st_ino, key};
+}
+
+// Reads the key file at path, which must be a regular file of exactly the
+// key's size.
+tn::Result<SandboxKey> readKeyFile(const std::string& path) {
+  struct stat status {};
+  if (::stat(path.c_str(), &status) == 0) {
+    if (std::optional<SandboxKey> known = cachedKey(path, status)) return *known;
+  }
+  const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+  if (fd < 0) return keyError(path, "cannot open", errno);
+  SandboxKey key{};
+  ssize_t got = -1;
+  int error = 0;
+  if (::fstat(fd, &status) != 0) {
+    error = errno;
+  } else if (!S_ISREG(status.st_mode) || status.st_size != static_cast<off_t>(key.size())) {
+    error = EINVAL;
+  } else {
+    do got = ::read(fd, key.data(), key.size());
+    while (got < 0 && errno == EINTR);
+    if (got != static_cast<ssize_t>(key.size())) error = got < 0 ? errno : EINVAL;
+  }
+  ::close(fd);
+  if (error == EINVAL) return keyError(path, "not a key file of 32 bytes", error);
+  if (error != 0) return keyError(path, "cannot read", error);
+  rememberKey(path, status, key);
+  return key;
+}
+
+tn::Result<void> makeDirectories(const std::string& directory) {
+  for (size_t slash = directory.find('/', 1);; slash = directory.find('/', slash + 1)) {
+    const std::string prefix = directory.substr(0, slash);
+    if (!prefix.empty() && ::mkdir(prefix.c_str(), 0755) != 0 && errno != EEXIST) {
+      return keyError(prefix, "cannot create the directory", errno);
+    }
+    if (slash == std::string::npos) return {};
+  }
+}
+
+bool writeAll(int fd, const uint8_t* bytes, size_t size) {
+  while (size > 0) {
+    const ssize_t n = ::write(fd, bytes, size);
+    if (n < 0 && errno == EINTR) continue;
+    if (n < 0) return false;
+    bytes += n;
+    size -= static_cast<size_t>(n);
+  }
+  return true;
+}
+
+// Writes a new random key into a temporary file beside path and links it to
+// path. Answers EEXIST when another process linked its key first.
+tn::Result<void> createKeyFile(const std::string& path) {
+  const std::string directory = path.substr(0, path.rfind('/'));
+  if (tn::Result<void> made = makeDirectories(directory); !made) return made;
+  SandboxKey key{};
+  if (RAND_bytes(key.data(), static_cast<int>(key.size())) != 1) return keyError(path, "no randomness", EIO);
+
+  std::string temporary = path + ".tmp-XXXXXX";
+  const int fd = ::mkostemp(temporary.data(), O_CLOEXEC);  // mode 0600
+  if (fd < 0) return keyError(path, "cannot create", errno);
+  int error = 0;
+  if (::fchmod(fd, 0600) != 0 || !writeAll(fd, key.data(), key.size()) || ::fsync(fd) != 0) error = errno;
+  if (::close(fd) != 0 && error == 0) error = errno;
+  // link() never replaces an existing name, unlike rename(): of two
+  // processes creating the key at once exactly one wins.
+  if (error == 0 && ::link(temporary.c_str(), path.c_str()) != 0) error = errno;
+  ::unlink(temporary.c_str());
+  if (error != 0) return keyError(path, "cannot create", error);
+  const int directoryFd = ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (directoryFd >= 0) {
+    ::fsync(directoryFd);
+    ::close(directoryFd);
+  }
+  return {};
+}
+
+}  // namespace
+
+std::string sandboxKeyPath() {
+  const char* root = std::getenv("TENON_ROOT");
+  return std::string(root != nullptr ? root : "") + "/var/lib/tenon/sandbox.key";
+}
+
+tn::Result<SandboxKey> readSandboxKey() { return readKeyFile(sandboxKeyPath()); }
+
+tn::Result<SandboxKey> loadOrCreateSandboxKey() {
+  const std::string path = sandboxKeyPath();
+  // Another process may remove the key between our link and our read; a few
+  // rounds settle that, and a file that keeps vanishing is an error.
+  constexpr int kAttempts = 4;
+  for (int attempt = 0; attempt < kAttempts; ++attempt) {
+    tn::Result<SandboxKey> existing = readKeyFile(path);
+    if (existing || existing.error().code() != ENOENT) return existing;
+    tn::Result<void> created = createKeyFile(path);
+    if (!created && created.error().code() != EEXIST) return created.error();
+    // Created here or by a process that raced us: read whichever won.
+  }
+  return keyError(path, "cannot create", EAGAIN);
+}
+
+}  // namespace sandbox

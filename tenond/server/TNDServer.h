@@ -23,6 +23,7 @@
 
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/relay/Listener.h"
+#include "tenond/database/TNDUserPrefs.h"
 #include "tenond/database/TNDatabase.h"
 
 namespace tnd {
@@ -74,6 +75,8 @@ class TNDServer final : public TNDatabase,
   const std::shared_ptr<tn::dispatch::SerialQueue>& relayQueue() const { return relayQueue_; }
   const std::shared_ptr<tn::dispatch::SerialQueue>& mainQueue() const { return mainQueue_; }
   const std::shared_ptr<tn::dispatch::SerialQueue>& syncQueue() const { return syncQueue_; }
+  // The reader of the user's preferences (exclusions), made at start-up.
+  const TNDUserPrefs& userPrefs() const { return userPrefs_; }
   const std::shared_ptr<relay::Listener>& service() const { return service_; }
 
  private:
@@ -86,6 +89,7 @@ class TNDServer final : public TNDatabase,
   std::shared_ptr<tn::dispatch::SerialQueue> syncQueue_;
   std::shared_ptr<relay::Listener> service_;
   std::vector<std::shared_ptr<TNDPlugInHold>> holds_;  // on syncQueue_ only
+  TNDUserPrefs userPrefs_;
 };
 
 }  // namespace tnd

@@ -76,6 +76,14 @@ TEST_F(Registration, AddRegistersInOrderAndStopsAtTheFirstBadPath) {
   EXPECT_EQ(found.exitStatus, 1) << "find is served in a later release";
   EXPECT_NE(registryListing().find(target), std::string::npos);
 
+  // Relative paths and links to nowhere get the path errors.
+  const auto relative = tnctl({"request", R"({"request":"add","version":3,"paths":["relative/X.bundle"]})"});
+  EXPECT_EQ(relative.exitStatus, 1);
+  EXPECT_NE(relative.err.find("tnctl: error 9: "), std::string::npos) << relative.err;
+  std::filesystem::create_directory_symlink(daemon_.root() + "/nowhere", daemon_.root() + "/links/Dangling.bundle");
+  EXPECT_EQ(tnctl({"add", daemon_.root() + "/links/Dangling.bundle"}).err,
+            "tnctl: error 9: invalid plugin path: " + daemon_.root() + "/links/Dangling.bundle\n");
+
   // A directory that is no bundle is refused by the registrar.
   std::filesystem::create_directories(daemon_.root() + "/empty.bundle");
   const auto refused = tnctl({"add", daemon_.root() + "/empty.bundle"});

@@ -19,7 +19,7 @@ const Transaction::Route Transaction::kRoutes[] = {
     {"bulk", &Transaction::bulkPlugIns},   {"match", &Transaction::unrecognized},
     {"ready", &Transaction::unrecognized}, {"access", &Transaction::unrecognized},
     {"annotate", &Transaction::unrecognized}, {"bulk-annotate", &Transaction::unrecognized},
-    {"lock", &Transaction::unrecognized},  {"find", &Transaction::unrecognized},
+    {"lock", &Transaction::unrecognized},  {"find", &Transaction::findPlugIn},
 };
 
 Transaction::Transaction(relay::Message request, std::shared_ptr<TNDRelayClient> client)

@@ -16,10 +16,12 @@
 
 #include "platform/relay/Connection.h"
 #include "platform/value/Error.h"
+#include "platform/value/UUID.h"
 #include "platform/value/Value.h"
 
 namespace tnd {
 
+class TNDPlugIn;
 class TNDRelayClient;
 class TNDServer;
 
@@ -79,6 +81,15 @@ class Transaction {
 
   void route(const std::string* type);
   void unrecognized();
+
+  // Lookup requests (LookupRequests.cpp).
+  void findPlugIn();
+  std::shared_ptr<TNDPlugIn> findPlugInByUUID(const tn::UUID& uuid);
+  std::shared_ptr<TNDPlugIn> findPlugInByPathURL(const std::string& text);
+  // Sets the form's "annotations": the stored annotation, else an empty one.
+  void addAnnotationForPlugIn(const TNDPlugIn& plugIn, tn::Dictionary& form);
+  // The policy hook for plug-ins without a stored annotation: no for all.
+  static bool pluginShouldBeAutoEnabled(const TNDPlugIn& plugIn);
 
   // Registration requests (RegistrationRequests.cpp).
   void addPlugIns();

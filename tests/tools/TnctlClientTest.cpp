@@ -68,7 +68,6 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
   for (std::vector<std::string> operation : std::vector<std::vector<std::string>>{
            {"match"},
            {"match", "--rules", R"({"XTExtensionPoint":"com.example.filter"})", "--flags", "0x1"},
-           {"find", "--uuid", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"},
            {"release", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"},
        }) {
     const auto result = tnctl(operation);
@@ -76,6 +75,8 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
     EXPECT_EQ(result.err, "tnctl: error 4: unrecognized request\n") << operation[0];
     EXPECT_EQ(result.out, "") << operation[0];
   }
+  EXPECT_EQ(tnctl({"find", "--uuid", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"}).err,
+            "tnctl: error 15: Cannot locate PlugIn\n");
   const auto added = tnctl({"add", "/opt/A.tnx"});
   EXPECT_EQ(added.err, "tnctl: error 9: invalid plugin path: /opt/A.tnx\n");
   // None of it disturbed the daemon: it still stops cleanly.

@@ -1,9 +1,6 @@
 #include "platform/notify/DirectoryWatch.h"
 
-#include <poll.h>
-#include <sys/eventfd.h>
 #include <sys/inotify.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
@@ -19,80 +16,51 @@ namespace {
 constexpr uint32_t kWatchMask = IN_MODIFY | IN_CLOSE_WRITE | IN_CREATE | IN_DELETE | IN_MOVED_FROM |
                                 IN_MOVED_TO | IN_ATTRIB | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
 
-tn::Error systemError(std::string_view what, int error) {
-  return notifyError(NotifyErrorCode::FileSystem, fmt::format("{}: {}", what, std::strerror(error)));
-}
-
 }  // namespace
 
 tn::Result<std::unique_ptr<DirectoryWatch>> DirectoryWatch::create(const std::string& directory, Callback callback) {
   if (!callback) return notifyError(NotifyErrorCode::InvalidArgument, "a directory watch needs a callback");
-  const int inotify = ::inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
-  if (inotify < 0) return systemError("cannot create an inotify instance", errno);
-  if (::inotify_add_watch(inotify, directory.c_str(), kWatchMask) < 0) {
-    const int error = errno;
-    ::close(inotify);
-    return systemError(fmt::format("{}: cannot watch", directory), error);
+  tn::Result<std::unique_ptr<InotifyChannel>> channel = InotifyChannel::open();
+  if (!channel) return channel.error();
+  if ((*channel)->addWatch(directory, kWatchMask) < 0) {
+    return notifyError(NotifyErrorCode::FileSystem, fmt::format("{}: cannot watch: {}", directory, std::strerror(errno)));
   }
-  const int wakeup = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-  if (wakeup < 0) {
-    const int error = errno;
-    ::close(inotify);
-    return systemError("cannot create an eventfd", error);
-  }
-  return std::make_unique<DirectoryWatch>(CreateTag(), directory, std::move(callback), inotify, wakeup);
+  return std::make_unique<DirectoryWatch>(CreateTag(), directory, std::move(callback), std::move(*channel));
 }
 
-DirectoryWatch::DirectoryWatch(CreateTag, std::string directory, Callback callback, int inotify, int wakeup)
-    : directory_(std::move(directory)), callback_(std::move(callback)), inotify_(inotify), wakeup_(wakeup) {
+DirectoryWatch::DirectoryWatch(CreateTag, std::string directory, Callback callback,
+                               std::unique_ptr<InotifyChannel> channel)
+    : directory_(std::move(directory)), callback_(std::move(callback)), channel_(std::move(channel)) {
   thread_ = std::thread([this] { run(); });
 }
 
 DirectoryWatch::~DirectoryWatch() {
-  const uint64_t one = 1;
-  while (::write(wakeup_, &one, sizeof one) < 0 && errno == EINTR) {
-  }
+  channel_->wake();
   thread_.join();
-  ::close(inotify_);
-  ::close(wakeup_);
 }
 
 void DirectoryWatch::run() {
-  pollfd fds[2] = {{inotify_, POLLIN, 0}, {wakeup_, POLLIN, 0}};
   for (;;) {
-    if (::poll(fds, 2, -1) < 0) {
-      if (errno == EINTR) continue;
-      TN_LOG_ERROR(tn::log::ops(), "watch of {} stopped: poll: {}", directory_, std::strerror(errno));
-      return;
+    switch (channel_->wait(-1)) {
+      case InotifyChannel::Wait::Woken:
+        return;
+      case InotifyChannel::Wait::Failed:
+        TN_LOG_ERROR(tn::log::ops(), "watch of {} stopped: poll: {}", directory_, std::strerror(errno));
+        return;
+      case InotifyChannel::Wait::Timeout:
+      case InotifyChannel::Wait::Events:
+        break;
     }
-    if (fds[1].revents != 0) return;
-    if (fds[0].revents == 0) continue;
     DirectoryChanges changes;
-    if (!readEvents(changes)) continue;
+    const bool readAny = channel_->drain([&](uint32_t mask, std::string_view name) {
+      if ((mask & IN_Q_OVERFLOW) != 0) changes.overflow = true;
+      if ((mask & (IN_IGNORED | IN_DELETE_SELF | IN_MOVE_SELF)) != 0) changes.directoryGone = true;
+      if (!name.empty()) changes.names.emplace(name);
+    });
+    if (!readAny) continue;
     if (!changes.names.empty() || changes.overflow || changes.directoryGone) callback_(changes);
     if (changes.directoryGone) return;
   }
-}
-
-bool DirectoryWatch::readEvents(DirectoryChanges& into) {
-  alignas(inotify_event) char buffer[16 * 1024];
-  bool readAny = false;
-  for (;;) {
-    const ssize_t n = ::read(inotify_, buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) break;
-    readAny = true;
-    for (size_t offset = 0; offset < static_cast<size_t>(n);) {
-      inotify_event event;
-      std::memcpy(&event, buffer + offset, sizeof event);
-      const char* name = buffer + offset + sizeof event;
-      if ((event.mask & IN_Q_OVERFLOW) != 0) into.overflow = true;
-      if ((event.mask & (IN_IGNORED | IN_DELETE_SELF | IN_MOVE_SELF)) != 0) into.directoryGone = true;
-      if (event.len > 0) into.names.emplace(name, ::strnlen(name, event.len));
-      offset += sizeof event + event.len;
-    }
-  }
-  return readAny;
 }
 
 }  // namespace notify

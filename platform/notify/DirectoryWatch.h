@@ -20,6 +20,7 @@
 #include <string_view>
 #include <thread>
 
+#include "platform/notify/InotifyChannel.h"
 #include "platform/value/Result.h"
 
 namespace notify {
@@ -53,17 +54,15 @@ class DirectoryWatch {
 
   const std::string& directory() const { return directory_; }
 
-  // Takes ownership of both descriptors. Use create().
-  DirectoryWatch(CreateTag, std::string directory, Callback callback, int inotify, int wakeup);
+  // Use create().
+  DirectoryWatch(CreateTag, std::string directory, Callback callback, std::unique_ptr<InotifyChannel> channel);
 
  private:
-  void run();                              // the thread's loop
-  bool readEvents(DirectoryChanges& into);  // false when nothing could be read
+  void run();  // the thread's loop
 
   const std::string directory_;
   const Callback callback_;
-  const int inotify_;
-  const int wakeup_;  // an eventfd the destructor signals
+  const std::unique_ptr<InotifyChannel> channel_;
   std::thread thread_;
 };
 

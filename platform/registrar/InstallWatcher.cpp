@@ -1,9 +1,6 @@
 #include "platform/registrar/InstallWatcher.h"
 
-#include <poll.h>
-#include <sys/eventfd.h>
 #include <sys/inotify.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
@@ -23,48 +20,33 @@ constexpr uint32_t kWatchMask = IN_CLOSE_WRITE | IN_CREATE | IN_DELETE | IN_MOVE
 // after this many settle times.
 constexpr int kMaxSettleRounds = 20;
 
-tn::Error systemError(std::string_view what, int error) {
-  return registrarError(RegistrarErrorCode::Store, fmt::format("{}: {}", what, std::strerror(error)));
-}
-
 }  // namespace
 
 tn::Result<std::unique_ptr<InstallWatcher>> InstallWatcher::create(std::chrono::milliseconds settle,
                                                                    Callback callback) {
-  const int inotify = ::inotify_init1(IN_CLOEXEC | IN_NONBLOCK);
-  if (inotify < 0) return systemError("cannot create an inotify instance", errno);
-  const int wakeup = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-  if (wakeup < 0) {
-    const int error = errno;
-    ::close(inotify);
-    return systemError("cannot create an eventfd", error);
-  }
-  return std::make_unique<InstallWatcher>(CreateTag(), settle, std::move(callback), inotify, wakeup);
+  tn::Result<std::unique_ptr<notify::InotifyChannel>> channel = notify::InotifyChannel::open();
+  if (!channel) return registrarError(RegistrarErrorCode::Store, channel.error().message().value_or(""));
+  return std::make_unique<InstallWatcher>(CreateTag(), settle, std::move(callback), std::move(*channel));
 }
 
-InstallWatcher::InstallWatcher(CreateTag, std::chrono::milliseconds settle, Callback callback, int inotify,
-                               int wakeup)
-    : settle_(settle), callback_(std::move(callback)), inotify_(inotify), wakeup_(wakeup) {
+InstallWatcher::InstallWatcher(CreateTag, std::chrono::milliseconds settle, Callback callback,
+                               std::unique_ptr<notify::InotifyChannel> channel)
+    : settle_(settle), callback_(std::move(callback)), channel_(std::move(channel)) {
   thread_ = std::thread([this] { run(); });
 }
 
 InstallWatcher::~InstallWatcher() {
-  const uint64_t one = 1;
-  while (::write(wakeup_, &one, sizeof one) < 0 && errno == EINTR) {
-  }
+  channel_->wake();
   thread_.join();
-  ::close(inotify_);
-  ::close(wakeup_);
 }
 
 bool InstallWatcher::watch(const std::string& path) {
-  if (::inotify_add_watch(inotify_, path.c_str(), kWatchMask) >= 0) return true;
+  if (channel_->addWatch(path, kWatchMask) >= 0) return true;
   TN_LOG_DEBUG(tn::log::rg(), "cannot watch {}: {}", path, std::strerror(errno));
   return false;
 }
 
 void InstallWatcher::run() {
-  pollfd fds[2] = {{inotify_, POLLIN, 0}, {wakeup_, POLLIN, 0}};
   bool pending = false;  // events seen, callback not yet made
   std::chrono::steady_clock::time_point firstPending;
   for (;;) {
@@ -74,35 +56,24 @@ void InstallWatcher::run() {
       continue;
     }
     const int timeout = pending ? static_cast<int>(settle_.count()) : -1;
-    const int ready = ::poll(fds, 2, timeout);
-    if (ready < 0) {
-      if (errno == EINTR) continue;
-      TN_LOG_ERROR(tn::log::rg(), "install watch stopped: poll: {}", std::strerror(errno));
-      return;
+    switch (channel_->wait(timeout)) {
+      case notify::InotifyChannel::Wait::Woken:
+        return;
+      case notify::InotifyChannel::Wait::Failed:
+        TN_LOG_ERROR(tn::log::rg(), "install watch stopped: poll: {}", std::strerror(errno));
+        return;
+      case notify::InotifyChannel::Wait::Timeout:  // quiet for the settle time
+        pending = false;
+        callback_();
+        continue;
+      case notify::InotifyChannel::Wait::Events:
+        break;
     }
-    if (fds[1].revents != 0) return;
-    if (ready == 0) {  // quiet for the settle time
-      pending = false;
-      callback_();
-      continue;
-    }
-    if (fds[0].revents != 0 && drainEvents() && !pending) {
+    if (channel_->drain([](uint32_t, std::string_view) {}) && !pending) {
       pending = true;
       firstPending = std::chrono::steady_clock::now();
     }
   }
-}
-
-bool InstallWatcher::drainEvents() {
-  alignas(inotify_event) char buffer[16 * 1024];
-  bool readAny = false;
-  for (;;) {
-    const ssize_t n = ::read(inotify_, buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) break;
-    readAny = true;
-  }
-  return readAny;
 }
 
 }  // namespace registrar

@@ -20,6 +20,7 @@
 #include <string>
 #include <thread>
 
+#include "platform/notify/InotifyChannel.h"
 #include "platform/value/Result.h"
 
 namespace registrar {
@@ -45,16 +46,15 @@ class InstallWatcher {
   // False (logged at debug level) when it cannot be watched. Any thread.
   bool watch(const std::string& path);
 
-  InstallWatcher(CreateTag, std::chrono::milliseconds settle, Callback callback, int inotify, int wakeup);
+  InstallWatcher(CreateTag, std::chrono::milliseconds settle, Callback callback,
+                 std::unique_ptr<notify::InotifyChannel> channel);
 
  private:
   void run();
-  bool drainEvents();  // true when anything was read
 
   const std::chrono::milliseconds settle_;
   const Callback callback_;
-  const int inotify_;
-  const int wakeup_;  // an eventfd the destructor signals
+  const std::unique_ptr<notify::InotifyChannel> channel_;
   std::thread thread_;
 };
 

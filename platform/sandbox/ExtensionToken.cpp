@@ -1,5 +1,7 @@
 #include "platform/sandbox/ExtensionToken.h"
 
+#include "platform/value/PercentDecoding.h"
+
 #include <cerrno>
 
 #include <fmt/format.h>
@@ -34,30 +36,6 @@ void appendEscaped(std::string& out, std::string_view text) {
   }
 }
 
-int hexValue(char c) {
-  if (c >= '0' && c <= '9') return c - '0';
-  if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-  if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-  return -1;
-}
-
-std::optional<std::string> unescape(std::string_view field) {
-  std::string out;
-  out.reserve(field.size());
-  for (size_t i = 0; i < field.size(); ++i) {
-    if (field[i] != '%') {
-      out += field[i];
-      continue;
-    }
-    if (i + 2 >= field.size()) return std::nullopt;
-    const int high = hexValue(field[i + 1]);
-    const int low = hexValue(field[i + 2]);
-    if (high < 0 || low < 0) return std::nullopt;
-    out += static_cast<char>(high << 4 | low);
-    i += 2;
-  }
-  return out;
-}
 
 std::string hexSignature(std::string_view signedText, const SandboxKey& key) {
   unsigned char digest[EVP_MAX_MD_SIZE];
@@ -119,8 +97,8 @@ tn::Result<ExtensionToken> parseExtensionToken(std::string_view text) {
   } else {
     return malformed("unknown kind");
   }
-  std::optional<std::string> extensionClass = unescape(fields[2]);
-  std::optional<std::string> subject = unescape(fields[3]);
+  std::optional<std::string> extensionClass = tn::percentDecode(fields[2]);
+  std::optional<std::string> subject = tn::percentDecode(fields[3]);
   if (!extensionClass || !subject) return malformed("bad escape");
   if (extensionClass->empty()) return malformed("no extension class");
   if (subject->empty()) return malformed("no subject");

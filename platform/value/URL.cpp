@@ -1,5 +1,7 @@
 #include "platform/value/URL.h"
 
+#include "platform/value/PercentDecoding.h"
+
 #include <cctype>
 
 namespace tn {
@@ -13,32 +15,6 @@ bool isUnreserved(unsigned char c) {
 bool isPathSafe(unsigned char c) {
   return c == '/' || c == '!' || c == '$' || c == '&' || c == '\'' || c == '(' || c == ')' ||
          c == '*' || c == '+' || c == ',' || c == ';' || c == '=' || c == ':' || c == '@';
-}
-
-int hexDigit(char c) {
-  if (c >= '0' && c <= '9') return c - '0';
-  if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-  if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-  return -1;
-}
-
-std::optional<std::string> percentDecode(std::string_view s) {
-  std::string out;
-  out.reserve(s.size());
-  for (size_t i = 0; i < s.size(); ++i) {
-    if (s[i] != '%') {
-      out.push_back(s[i]);
-      continue;
-    }
-    if (i + 2 >= s.size()) return std::nullopt;
-    const int hi = hexDigit(s[i + 1]), lo = hexDigit(s[i + 2]);
-    if (hi < 0 || lo < 0) return std::nullopt;
-    const char c = static_cast<char>(hi << 4 | lo);
-    if (c == '\0') return std::nullopt;
-    out.push_back(c);
-    i += 2;
-  }
-  return out;
 }
 
 bool isSchemeChar(char c, bool first) {
@@ -92,6 +68,40 @@ std::string URL::absoluteString() const {
       out.push_back(kHex[c >> 4]);
       out.push_back(kHex[c & 0xF]);
     }
+  }
+  return out;
+}
+
+}  // namespace tn
+
+namespace tn {
+namespace {
+
+int hexDigit(char c) {
+  if (c >= '0' && c <= '9') return c - '0';
+  if (c >= 'a' && c <= 'f') return c - 'a' + 10;
+  if (c >= 'A' && c <= 'F') return c - 'A' + 10;
+  return -1;
+}
+
+}  // namespace
+
+std::optional<std::string> percentDecode(std::string_view text) {
+  std::string out;
+  out.reserve(text.size());
+  for (size_t i = 0; i < text.size(); ++i) {
+    if (text[i] != '%') {
+      out.push_back(text[i]);
+      continue;
+    }
+    if (i + 2 >= text.size()) return std::nullopt;
+    const int high = hexDigit(text[i + 1]);
+    const int low = hexDigit(text[i + 2]);
+    if (high < 0 || low < 0) return std::nullopt;
+    const char c = static_cast<char>(high << 4 | low);
+    if (c == '\0') return std::nullopt;
+    out.push_back(c);
+    i += 2;
   }
   return out;
 }

@@ -35,7 +35,7 @@ Value pluginForm() {
   form.set("BNBundleVersion", Value("1742.3.1"));
   form.set("BNBundleShortVersionString", Value("12.4"));
   form.set("BNBundleExecutable", Value("photos-share"));
-  form.set("BNBundlePackageType", Value("XPC!"));
+  form.set("BNBundlePackageType", Value("TNPI"));
   form.set("BNBundleDevelopmentRegion", Value("en"));
   form.set("TNPlugInUUID", Value(UUID::random()));
   form.set("TNRegistrationDate", Value(Date{1795902780.25}));

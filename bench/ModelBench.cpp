@@ -84,7 +84,7 @@ tn::Dictionary thirtyKeySDK() {
   return tn::Dictionary{{"XTExtension", tn::Value(std::move(extension))},
                         {"BNBundleDevelopmentRegion", "en"},
                         {"MinimumSystemVersion", "1.0"},
-                        {"BNBundlePackageType", "XPC!"}};
+                        {"BNBundlePackageType", "TNPI"}};
 }
 
 void BM_ResolveSDK(benchmark::State& state) {

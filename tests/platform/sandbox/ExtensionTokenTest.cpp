@@ -30,7 +30,7 @@ SandboxKey keyOf(uint8_t fill) {
 }
 
 std::string fileBytes(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
+  std::ifstream in(path, std::ifstream::binary);
   return std::string(std::istreambuf_iterator<char>(in), {});
 }
 

@@ -23,7 +23,7 @@ namespace {
 namespace fs = std::filesystem;
 
 std::string contentsOf(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
+  std::ifstream in(path, std::ifstream::binary);
   std::stringstream s;
   s << in.rdbuf();
   return s.str();

@@ -40,6 +40,7 @@ DirectoryWatch::~DirectoryWatch() {
 }
 
 void DirectoryWatch::run() {
+  bool gone = false;  // the directory went away and the callback was told
   for (;;) {
     switch (channel_->wait(-1)) {
       case InotifyChannel::Wait::Woken:
@@ -58,8 +59,11 @@ void DirectoryWatch::run() {
       if (!name.empty()) changes.names.emplace(name);
     });
     if (!readAny) continue;
+    if (gone) continue;  // nothing more to tell; wait for the owner's wake
     if (!changes.names.empty() || changes.overflow || changes.directoryGone) callback_(changes);
-    if (changes.directoryGone) return;
+    // The thread stays until the owner wakes it: a thread that ended by
+    // itself would wait unjoined for as long as its owner lives.
+    gone = changes.directoryGone;
   }
 }
 

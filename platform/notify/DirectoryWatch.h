@@ -11,7 +11,7 @@
 // (typically: queue work elsewhere). Creation, modification, removal and
 // renames of entries count, and so does an overflow of the kernel's event
 // queue (then every name may have changed). When the directory itself goes
-// away the callback is told (`directoryGone`) and the watch ends.
+// away the callback is told (`directoryGone`) once, and no more calls come.
 
 #include <functional>
 #include <memory>

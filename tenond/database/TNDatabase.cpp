@@ -54,6 +54,10 @@ TNDatabase::~TNDatabase() {
 
 bool TNDatabase::initWithDatabase(const std::optional<std::string>& path,
                                   std::shared_ptr<tn::dispatch::SerialQueue> localeQueue) {
+  // The annotation file's place is checked first: it costs nothing, and a
+  // daemon that could never save a choice should not scan anything.
+  annotations_ = std::make_unique<TNDAnnotationStore>(path);
+  if (!annotationDirectoryUsable(annotations_->annotationsPath())) return false;
   tn::Result<std::shared_ptr<registrar::Registrar>> opened =
       registrar::Registrar::open(registrar::RegistrarPaths::fromEnvironment(), {});
   if (!opened) {
@@ -62,8 +66,6 @@ bool TNDatabase::initWithDatabase(const std::optional<std::string>& path,
   }
   workspace_ = *opened;
   lookup_ = std::make_unique<tn::RegistrarLookup>(workspace_);
-  annotations_ = std::make_unique<TNDAnnotationStore>(path);
-  if (!annotationDirectoryUsable(annotations_->annotationsPath())) return false;
   sync_ = tn::dispatch::SerialQueue::create("TNDatabase");
   observer_ = std::make_shared<RegistrarObserver>(*this);
   workspace_->addObserver(observer_);

@@ -15,6 +15,7 @@
 #include "platform/relay/ServicePath.h"
 #include "platform/value/Cbor.h"
 #include "platform/notify/Post.h"
+#include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
 
@@ -90,8 +91,9 @@ TEST(TenondCommandLine, UsageErrorsPrintTheExactUsageLineAndExitWithStatus2) {
 }
 
 TEST(TenondCommandLine, AnUnusableDatabasePathMeansExitStatus1) {
+  TempDirectory root;
   const ProcessResult r = runProcess({kTenond, "-S", "unused.service", "-d", "/dev/null/annotations"},
-                                     {"TENON_ROOT=/tmp"});
+                                     {"TENON_ROOT=" + root.path()});
   EXPECT_EQ(r.exitStatus, 1);
   EXPECT_NE(r.err.find("unable to construct server"), std::string::npos) << r.err;
 }

@@ -13,9 +13,8 @@ std::optional<Dictionary> RegistrarLookup::sdkDictionary(std::string_view extens
 
 std::optional<TNRegistryLookup::LocalizedStrings> RegistrarLookup::localizedStrings(
     const URL& plugInBundle, std::string_view table, const std::set<std::string, std::less<>>& keys) const {
-  auto strings = registrar_->localizedStrings(plugInBundle.path(), table, keys);
-  if (!strings) return std::nullopt;
-  return LocalizedStrings(strings->begin(), strings->end());
+  // The registrar's strings map is the model's type.
+  return registrar_->localizedStrings(plugInBundle.path(), table, keys);
 }
 
 }  // namespace tn

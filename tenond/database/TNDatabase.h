@@ -19,7 +19,9 @@
 // cacheLimit entries empties the cache (and the registrar's schema caches)
 // first, so the cache never holds more than cacheLimit + 1 plug-ins.
 
+#include <atomic>
 #include <cstdint>
+#include <mutex>
 #include <memory>
 #include <optional>
 #include <string>

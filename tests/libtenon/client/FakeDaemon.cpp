@@ -8,19 +8,6 @@
 
 namespace tn::test {
 
-TempRoot::TempRoot() {
-  char pattern[] = "/tmp/client-XXXXXX";  // short: socket paths must fit a sockaddr_un
-  if (::mkdtemp(pattern) == nullptr) ADD_FAILURE() << "mkdtemp failed";
-  path_ = pattern;
-  ::setenv("TENON_ROOT", path_.c_str(), 1);
-}
-
-TempRoot::~TempRoot() {
-  ::unsetenv("TENON_ROOT");
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
-}
-
 FakeDaemon::FakeDaemon(std::string serviceName, Responder respond) {
   requests_->respond = respond ? std::move(respond) : [](const Value&) { return Value(Dictionary()); };
   auto listener = relay::Listener::create(std::move(serviceName), queue_);

@@ -13,6 +13,7 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/TempDirectory.h"
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/relay/Connection.h"
 #include "platform/relay/Listener.h"
@@ -21,18 +22,6 @@
 namespace tn::test {
 
 inline constexpr std::chrono::seconds kPatience{20};
-
-// A fresh directory as TENON_ROOT for the lifetime of the object.
-class TempRoot {
- public:
-  TempRoot();
-  ~TempRoot();
-  TempRoot(const TempRoot&) = delete;
-  TempRoot& operator=(const TempRoot&) = delete;
-
- private:
-  std::string path_;
-};
 
 class FakeDaemon {
  public:

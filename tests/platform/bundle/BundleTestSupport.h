@@ -12,31 +12,9 @@
 #include <fstream>
 #include <string>
 
+#include "tests/support/TempDirectory.h"
+
 namespace tn::test {
-
-// A fresh directory under /tmp (mode 0700, owned by the test's user),
-// removed with everything in it at the end of the test.
-class TempDirectory {
- public:
-  TempDirectory() {
-    std::string pattern = (std::filesystem::temp_directory_path() / "tenon-test-XXXXXX").string();
-    const char* made = ::mkdtemp(pattern.data());
-    EXPECT_NE(made, nullptr);
-    path_ = pattern;
-  }
-  ~TempDirectory() {
-    std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
-  }
-  TempDirectory(const TempDirectory&) = delete;
-  TempDirectory& operator=(const TempDirectory&) = delete;
-
-  const std::string& path() const { return path_; }
-  std::string operator/(std::string_view relative) const { return path_ + "/" + std::string(relative); }
-
- private:
-  std::string path_;
-};
 
 // Creates path and the missing directories above it; those it creates get
 // mode 0755 whatever the umask, and path itself gets mode.

@@ -14,6 +14,7 @@
 
 #include "platform/dispatch/Semaphore.h"
 #include "platform/locale/Locale.h"
+#include "tests/support/TempDirectory.h"
 
 namespace locale {
 namespace {
@@ -21,13 +22,8 @@ namespace {
 class Locale : public ::testing::Test {
  protected:
   void SetUp() override {
-    char pattern[] = "/tmp/locale-test-XXXXXX";
-    ASSERT_NE(::mkdtemp(pattern), nullptr);
-    root_ = pattern;
-    ::setenv("TENON_ROOT", root_.c_str(), 1);
     for (const char* key : {"LC_ALL", "LC_MESSAGES", "LANG"}) ::unsetenv(key);
   }
-  void TearDown() override { std::filesystem::remove_all(root_); }
 
   // Replaces the file the way configuration tools do: a new file renamed
   // over the old one.
@@ -38,7 +34,8 @@ class Locale : public ::testing::Test {
     std::filesystem::rename(temporary, localeConfigurationPath());
   }
 
-  std::string root_;
+  tn::test::TempRoot temp_;
+  const std::string& root_ = temp_.path();
 };
 
 TEST_F(Locale, ValuesAreReducedToLanguageAndRegion) {

@@ -13,6 +13,7 @@
 #include <fstream>
 
 #include "platform/prefs/PreferenceDomain.h"
+#include "tests/support/TempDirectory.h"
 
 namespace prefs {
 namespace {
@@ -21,14 +22,8 @@ using tn::Value;
 
 class Preferences : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char pattern[] = "/tmp/prefs-test-XXXXXX";
-    ASSERT_NE(::mkdtemp(pattern), nullptr);
-    root_ = pattern;
-    ::setenv("TENON_ROOT", root_.c_str(), 1);
-  }
-  void TearDown() override { std::filesystem::remove_all(root_); }
-  std::string root_;
+  tn::test::TempRoot temp_;
+  const std::string& root_ = temp_.path();
 };
 
 TEST_F(Preferences, AMissingDomainIsEmptyAndWritesAreSeenByTheNextRead) {

@@ -17,19 +17,6 @@
 
 namespace relay::test {
 
-TempRoot::TempRoot() {
-  char pattern[] = "/tmp/relay-XXXXXX";  // short: socket paths must fit a sockaddr_un
-  if (::mkdtemp(pattern) == nullptr) ADD_FAILURE() << "mkdtemp failed";
-  path_ = pattern;
-  ::setenv("TENON_ROOT", path_.c_str(), 1);
-}
-
-TempRoot::~TempRoot() {
-  ::unsetenv("TENON_ROOT");
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
-}
-
 bool eventually(const std::function<bool()>& condition) {
   const auto deadline = std::chrono::steady_clock::now() + kPatience;
   while (!condition()) {

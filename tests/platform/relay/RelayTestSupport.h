@@ -17,6 +17,7 @@
 #include <string>
 #include <vector>
 
+#include "tests/support/TempDirectory.h"
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/log/CaptureSink.h"
 #include "platform/relay/Connection.h"
@@ -27,18 +28,7 @@ namespace relay::test {
 
 inline constexpr std::chrono::seconds kPatience{20};
 
-// A fresh directory as TENON_ROOT for the lifetime of the object.
-class TempRoot {
- public:
-  TempRoot();
-  ~TempRoot();
-  TempRoot(const TempRoot&) = delete;
-  TempRoot& operator=(const TempRoot&) = delete;
-  const std::string& path() const { return path_; }
-
- private:
-  std::string path_;
-};
+using TempRoot = tn::test::TempRoot;
 
 // Tests with sockets: a private root; the log captured (violations are
 // logged as errors, and tests may assert on them).

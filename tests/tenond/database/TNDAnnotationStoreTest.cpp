@@ -15,6 +15,7 @@
 #include "platform/log/CaptureSink.h"
 #include "platform/value/Document.h"
 #include "tenond/database/TNDAnnotationStore.h"
+#include "tests/support/TempDirectory.h"
 
 namespace tnd {
 namespace {
@@ -24,13 +25,6 @@ using tn::Value;
 
 class AnnotationStore : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char pattern[] = "/tmp/annotation-store-XXXXXX";
-    ASSERT_NE(::mkdtemp(pattern), nullptr);
-    directory_ = pattern;
-    path_ = directory_ + "/Tenon-Annotations";
-  }
-  void TearDown() override { std::filesystem::remove_all(directory_); }
 
   void writeFile(const std::string& text) { std::ofstream(path_, std::ofstream::binary) << text; }
   Value readFile() const { return *tn::readDocumentFile(path_); }
@@ -40,8 +34,9 @@ class AnnotationStore : public ::testing::Test {
     return false;
   }
 
-  std::string directory_;
-  std::string path_;
+  tn::test::TempDirectory temp_;
+  const std::string& directory_ = temp_.path();
+  const std::string path_ = temp_ / "Tenon-Annotations";
 };
 
 TEST_F(AnnotationStore, FirstStartIsEmptyQuietAndWritesNothingUntilAChange) {

@@ -10,14 +10,13 @@
 
 #include "platform/log/CaptureSink.h"
 #include "tenond/database/TNDUserPrefs.h"
-#include "tests/platform/bundle/BundleTestSupport.h"
+#include "tests/support/TempDirectory.h"
 
 namespace tnd {
 namespace {
 
 TEST(UserPrefs, ExclusionsWrittenByAnotherProcessAfterStartAreSeen) {
-  tn::test::TempDirectory root;
-  ::setenv("TENON_ROOT", root.path().c_str(), 1);
+  const tn::test::TempRoot root;
   const TNDUserPrefs prefs;  // made before the value exists, as at start-up
   EXPECT_FALSE(prefs.exclusions());
 

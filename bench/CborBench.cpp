@@ -16,12 +16,13 @@ Value attributes() {
   Dictionary d;
   d.set("TNExtensionPointName", Value("com.ostrel.tenon.share-services"));
   d.set("TNExtensionPointVersion", Value("1.0"));
-  d.set("NSExtensionActivationRule", Value("TRUEPREDICATE"));
+  d.set("XTExtensionActivationRule",
+        Value(Dictionary{{"accepts", Value(Dictionary{{"image/*", Value(int64_t{16})}, {"video/*", Value(int64_t{1})}})}}));
   d.set("TNSupportsImages", Value(true));
   d.set("TNSupportsMovies", Value(false));
   d.set("TNMaximumItemCount", Value(int64_t{16}));
   d.set("TNPreferredWidth", Value(480.5));
-  d.set("TNAcceptedTypes", Value(Array{Value("public.image"), Value("public.movie"), Value("public.url")}));
+  d.set("TNAcceptedTypes", Value(Array{Value("image/png"), Value("video/mp4"), Value("text/uri-list")}));
   d.set("TNServiceRole", Value("viewer"));
   d.set("TNPrincipalClass", Value("ShareServiceMain"));
   return Value(std::move(d));

@@ -29,7 +29,7 @@ tn::Dictionary typicalInfo() {
                       {"XTExtensionProtocol", "com.example.share-protocol"},
                       {"Shared", tn::Array{"Resources", "Templates"}},
                       {"XTExtensionAttributes", tn::Dictionary{{"XTExtensionVersion", "2.4.1"},
-                                                               {"ShareTypes", tn::Array{"public.image", "public.text"}},
+                                                               {"ShareTypes", tn::Array{"image/png", "text/plain"}},
                                                                {"MaxItems", 10}}}}}};
 }
 

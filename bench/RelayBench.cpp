@@ -1,19 +1,20 @@
 // What the relay costs on top of the socket it runs on.
 //
-// BM_RawSocketEcho writes one frame over a socketpair to a thread that
-// echoes it back: the floor any transport on Unix sockets pays (two thread
-// wake-ups per round trip). BM_RelayRoundTrip sends the same request with
-// Connection::sendWithReply to a listener in this process that replies at
-// once; the ratio of the two is the relay's overhead. BM_RelayThroughput
-// keeps `depth` requests in flight on each of 32 connections.
+// BM_RawSocketEcho writes one frame (a minimal "find" request) over a
+// socketpair to a thread that echoes it back: the floor any transport on
+// Unix sockets pays (two thread wake-ups per round trip).
+// BM_FramedClientToTenond sends the same frame to a real tenond started for
+// the run, with a client that only frames bytes, as the echo's client does:
+// the daemon's own cost (reading, envelope checks, the service queue, the
+// reply). BM_DaemonClientToTenond makes the same request through
+// TNDaemonClient, the library hosts use (its logging checks, its reply
+// queue, the waiting thread). BM_RelayRoundTrip and
+// BM_DaemonClientRoundTrip measure the relay and the client library against
+// a listener in this process that replies at once; BM_RelayThroughput keeps
+// `depth` requests in flight on each of 32 connections.
 //
-// BM_DaemonClientRoundTrip is the same round trip made through
-// TNDaemonClient, the library hosts use (a "find" request, its logging
-// checks, the client's reply queue), against the same replying listener;
-// BM_DaemonClientToTenond makes it against a real tenond started for the
-// run (the daemon's envelope checks and dispatch included). Both belong
-// next to BM_RawSocketEcho of the same run: the target is a round trip
-// within 1.5 times the echo.
+// The ratios to the echo of the same run are printed after the table, with
+// their targets.
 //
 // Sockets live under a private TENON_ROOT made for the run.
 
@@ -23,6 +24,7 @@
 #include <signal.h>
 #include <spawn.h>
 #include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -35,6 +37,8 @@
 #include <thread>
 #include <vector>
 
+#include "bench/support/BenchDaemon.h"
+#include "bench/support/RatioReporter.h"
 #include "libtenon/client/BlockingReply.h"
 #include "libtenon/client/TNDaemonClient.h"
 #include "platform/dispatch/Semaphore.h"
@@ -44,38 +48,32 @@
 #include "platform/relay/Connection.h"
 #include "platform/relay/Frame.h"
 #include "platform/relay/Listener.h"
+#include "platform/relay/ServicePath.h"
 
 extern char** environ;
 
 namespace relay {
 namespace {
 
+using tn::bench::usePrivateRoot;
+
 using tn::dispatch::Semaphore;
 using tn::dispatch::SerialQueue;
 
+// A minimal real request: "find" of a plug-in nobody has.
 tn::Value smallRequest() {
-  return tn::Value(tn::Dictionary{{"request", "ping"}, {"version", 1}, {"flags", 0}});
+  static const tn::UUID uuid = tn::UUID::random();
+  return tn::Value(tn::Dictionary{{"request", "find"}, {"version", 3}, {"uuids", tn::Value(uuid)}});
 }
 
-// A private TENON_ROOT for the whole program, removed at exit.
-class PrivateRoot {
- public:
-  PrivateRoot() {
-    char pattern[] = "/tmp/relay-bench-XXXXXX";
-    if (::mkdtemp(pattern) == nullptr) std::abort();
-    path_ = pattern;
-    ::setenv("TENON_ROOT", path_.c_str(), 1);
+bool readAll(int fd, uint8_t* out, std::size_t size) {
+  for (std::size_t got = 0; got < size;) {
+    const ssize_t n = ::read(fd, out + got, size - got);
+    if (n <= 0) return false;
+    got += static_cast<std::size_t>(n);
   }
-  ~PrivateRoot() {
-    std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
-  }
-
- private:
-  std::string path_;
-};
-
-void usePrivateRoot() { static const PrivateRoot root; }
+  return true;
+}
 
 // A listener whose connections answer every request at once.
 class ReplyingServer {
@@ -112,14 +110,6 @@ void BM_RawSocketEcho(benchmark::State& state) {
   const tn::Bytes frame = *encodeFrame(smallRequest(), 0, 1);
   int pair[2];
   if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair) != 0) std::abort();
-  const auto readAll = [](int fd, uint8_t* out, std::size_t size) {
-    for (std::size_t got = 0; got < size;) {
-      const ssize_t n = ::read(fd, out + got, size - got);
-      if (n <= 0) return false;
-      got += static_cast<std::size_t>(n);
-    }
-    return true;
-  };
   std::thread echo([&] {
     tn::Bytes buffer(frame.size());
     while (readAll(pair[1], buffer.data(), buffer.size())) {
@@ -208,40 +198,36 @@ void BM_DaemonClientRoundTrip(benchmark::State& state) {
 }
 BENCHMARK(BM_DaemonClientRoundTrip)->UseRealTime();
 
-// The daemon binary beside this build, started under the private root with
-// its log silenced; stopped with SIGTERM at exit.
-class TenondForBench {
- public:
-  explicit TenondForBench(const std::string& service) {
-    usePrivateRoot();
-    std::string binary = std::string(TENON_BINARY_DIR) + "/tenond/tenond";
-    std::string option = "-S";
-    std::string name = service;
-    char* argv[] = {binary.data(), option.data(), name.data(), nullptr};
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
-    if (posix_spawn(&pid_, binary.c_str(), &actions, nullptr, argv, environ) != 0) std::abort();
-    posix_spawn_file_actions_destroy(&actions);
-    for (int attempt = 0; !Connection::connectToService(service, SerialQueue::create("bench.probe")).ok(); ++attempt) {
-      if (attempt == 500) std::abort();
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-  }
-  ~TenondForBench() {
-    ::kill(pid_, SIGTERM);
-    ::waitpid(pid_, nullptr, 0);
-  }
-
- private:
-  pid_t pid_ = -1;
-};
+// One daemon for every benchmark that needs one.
+const std::string& benchTenond() {
+  static tn::bench::TenondForBench daemon("bench.tenond");
+  return daemon.service();
+}
 
 void BM_DaemonClientToTenond(benchmark::State& state) {
-  static TenondForBench daemon("bench.tenond");
-  roundTripsThroughClient(state, "bench.tenond");
+  roundTripsThroughClient(state, benchTenond());
 }
 BENCHMARK(BM_DaemonClientToTenond)->UseRealTime();
 
+// The echo's client, talking to tenond: write a frame, read the reply.
+void BM_FramedClientToTenond(benchmark::State& state) {
+  tn::bench::FrameSocket socket(benchTenond());
+  if (!socket.connected()) std::abort();
+  tn::Bytes frame = tn::bench::findFrame();
+  tn::Bytes reply;
+  for (auto _ : state) {
+    if (!socket.send(frame) || !socket.receive(reply, tn::bench::FrameSocket::kNoLimit)) std::abort();
+  }
+  state.counters["reply_bytes"] = static_cast<double>(reply.size());
+}
+BENCHMARK(BM_FramedClientToTenond)->UseRealTime();
+
 }  // namespace
 }  // namespace relay
+
+int main(int argc, char** argv) {
+  return tn::bench::runWithRatios(argc, argv,
+                                  {{"BM_FramedClientToTenond", "BM_RawSocketEcho", 1.3},
+                                   {"BM_DaemonClientToTenond", "BM_RawSocketEcho", 1.6},
+                                   {"BM_RelayRoundTrip", "BM_RawSocketEcho", std::nullopt}});
+}

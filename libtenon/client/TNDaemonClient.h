@@ -113,6 +113,16 @@ class TNDaemonClient {
   // "match": discovery with rules and discovery flags; the reply's `matches`
   // holds the forms in the typed encoding (convertFromRelay).
   void matchPlugIns(const Dictionary& rules, uint64_t flags, ReplyBlock reply);
+  // "explain" (Tenon's own): why the plug-in named by `plugIn` (a UUID, or
+  // the path of its bundle) is or is not offered to a host for these rules
+  // and flags. The host is this process, or, for a manager, the program at
+  // `hostExecutable`. The reply's `explanation` holds the steps.
+  struct ExplainedPlugIn {
+    std::optional<UUID> uuid;
+    std::optional<std::string> path;
+  };
+  void explainPlugIn(const ExplainedPlugIn& plugIn, const Dictionary& rules, uint64_t flags,
+                     const std::optional<std::string>& hostExecutable, ReplyBlock reply);
   // "annotate": applies one annotation change to the plug-ins.
   void setPluginAnnotations(const std::vector<UUID>& uuids, const Dictionary& annotations, ReplyBlock reply);
   // "bulk-annotate": UUID string to extension dictionary.

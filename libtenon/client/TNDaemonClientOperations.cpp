@@ -73,6 +73,17 @@ void TNDaemonClient::matchPlugIns(const Dictionary& rules, uint64_t flags, Reply
   send(std::move(request), std::move(reply));
 }
 
+void TNDaemonClient::explainPlugIn(const ExplainedPlugIn& plugIn, const Dictionary& rules, uint64_t flags,
+                                   const std::optional<std::string>& hostExecutable, ReplyBlock reply) {
+  Dictionary request = this->request("explain");
+  if (plugIn.uuid) request.set("uuids", Value(*plugIn.uuid));
+  if (plugIn.path) request.set("paths", Value(*plugIn.path));
+  setConverted(request, "rules", Value(rules));
+  request.set("flags", Value(flags));
+  if (hostExecutable) request.set("host", Value(*hostExecutable));
+  send(std::move(request), std::move(reply));
+}
+
 void TNDaemonClient::setPluginAnnotations(const std::vector<UUID>& uuids, const Dictionary& annotations,
                                           ReplyBlock reply) {
   Dictionary request = this->request("annotate");

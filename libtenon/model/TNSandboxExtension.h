@@ -27,6 +27,21 @@ inline constexpr std::string_view kPlugInServiceExtensionClass = "com.ostrel.ten
 // to log.
 Result<std::string> issueFileExtension(const URL& url);
 
+// The canonical path of a resource a plug-in's manifest names inside its
+// bundle, or why it is refused. resource must be "." (the bundle itself) or
+// a relative path without NUL and without ".." components, and its
+// canonical path (links resolved) must be the bundle's canonical path or lie
+// below it. Refusals are errors of domain "Sandbox" with code EPERM and a
+// message saying why; a resource that does not exist (or cannot be
+// resolved) is the errno of the resolution (ENOENT, ...).
+Result<std::string> bundleResourcePath(std::string_view bundlePath, std::string_view resource);
+
+// A read-only file extension for a resource of the bundle: the token names
+// exactly the canonical path bundleResourcePath() checked, so a link changed
+// afterwards cannot widen it. Errors as bundleResourcePath's, or the
+// issuer's. Logged like issueFileExtension.
+Result<std::string> issueBundleResourceExtension(const URL& bundle, std::string_view resource);
+
 // A service-lookup extension of class "com.ostrel.tenon.plugin-service" for
 // the service name. Logged like issueFileExtension.
 Result<std::string> issueServiceExtension(std::string_view serviceName);

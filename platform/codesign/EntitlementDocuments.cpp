@@ -1,8 +1,7 @@
 #include "platform/codesign/EntitlementDocuments.h"
 
 #include <dirent.h>
-#include <limits.h>
-#include <stdlib.h>
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -14,6 +13,8 @@
 #include "platform/bundle/BundleLayout.h"
 #include "platform/bundle/BundlePaths.h"
 #include "platform/bundle/ManifestFile.h"
+#include "platform/codesign/DocumentCache.h"
+#include "platform/codesign/FileIdentity.h"
 #include "platform/codesign/TrustRule.h"
 #include "platform/log/Log.h"
 
@@ -22,18 +23,10 @@ namespace {
 
 constexpr std::string_view kManifestSuffix = ".manifest";
 
-// A document read for the executable, and whether the trust rule let it in.
+// A trusted document's entitlements (a dictionary) and where they came from.
 struct Candidate {
   std::string path;
-  tn::Value entitlements;   // a dictionary
-  tn::Result<void> trusted;
-};
-
-// A manifest's contents together with the trust rule's verdict on the very
-// file that was read.
-struct DocumentRead {
-  tn::Result<tn::Value> value;
-  tn::Result<void> trusted;
+  tn::Value entitlements;
 };
 
 void logIgnoredDocument(const std::string& path, std::string_view reason) {
@@ -42,42 +35,48 @@ void logIgnoredDocument(const std::string& path, std::string_view reason) {
 
 std::string reasonOf(const tn::Error& error) { return error.message().value_or(error.description()); }
 
-// Links resolved when the path exists; the lexical absolute path otherwise.
-std::string resolvedPath(const std::string& path) {
-  char resolved[PATH_MAX];
-  if (::realpath(path.c_str(), resolved) != nullptr) return resolved;
-  return bundle::absoluteBundlePath(path);
-}
-
-// None when there is no file at path (quietly) or it cannot be opened
-// (logged).
-std::optional<DocumentRead> readEntitlementDocument(const std::string& path, const TrustSettings& settings) {
+// The document at path when it passes the trust rule and parses; none (logged
+// unless there is no file at all) otherwise. The rule is checked on the open
+// file before anything is read from it.
+std::optional<tn::Value> readTrustedDocument(const std::string& path, const TrustSettings& settings) {
   const int fd = bundle::openManifestFile(path);
   if (fd < 0) {
-    if (errno == ENOENT) return std::nullopt;
-    logIgnoredDocument(path, std::strerror(errno));
+    if (errno != ENOENT) logIgnoredDocument(path, std::strerror(errno));
     return std::nullopt;
   }
-  DocumentRead document{bundle::readManifestDescriptor(fd, path), checkTrustedFile(fd, settings.daemonUser)};
+  std::optional<tn::Value> document;
+  if (const tn::Result<void> trusted = checkTrustedFile(fd, settings.daemonUser); !trusted) {
+    logIgnoredDocument(path, reasonOf(trusted.error()));
+  } else if (const DocumentCache::Parsed parsed = DocumentCache::shared().read(fd, path); !*parsed) {
+    logIgnoredDocument(path, reasonOf(parsed->error()));
+  } else {
+    document = **parsed;
+  }
   ::close(fd);
   return document;
 }
 
-std::optional<Candidate> bundleDocument(const std::string& executablePath, const TrustSettings& settings) {
+// The bundle's own document, for a trusted executable only.
+std::optional<Candidate> bundleDocument(const std::string& executablePath, const FileIdentity& running,
+                                        const TrustSettings& settings) {
   const std::optional<std::string> bundlePath = bundle::findEnclosingBundle(executablePath);
   if (!bundlePath) return std::nullopt;
   const std::string path = bundle::joinPath(*bundlePath, bundle::kEntitlementsManifestName);
-  std::optional<DocumentRead> document = readEntitlementDocument(path, settings);
-  if (!document) return std::nullopt;
-  if (!document->value) {
-    logIgnoredDocument(path, reasonOf(document->value.error()));
+  if (fileIdentityAt(executablePath) != running) {
+    // The process runs another file than the one at that path here: one
+    // mounted over it in the process's own mount namespace, or a file
+    // replaced since it was started.
+    if (::access(path.c_str(), F_OK) == 0)
+      logIgnoredDocument(path, executablePath + " here is not the file the process runs");
     return std::nullopt;
   }
-  if (!document->value->isDictionary()) {
+  std::optional<tn::Value> document = readTrustedDocument(path, settings);
+  if (!document) return std::nullopt;
+  if (!document->isDictionary()) {
     logIgnoredDocument(path, "the document is not a dictionary");
     return std::nullopt;
   }
-  return Candidate{path, *document->value, document->trusted};
+  return Candidate{path, std::move(*document)};
 }
 
 std::vector<std::string> manifestNames(const std::string& directory) {
@@ -100,17 +99,14 @@ std::vector<std::string> manifestNames(const std::string& directory) {
   return names;
 }
 
-// The entitlements of a document of the entitlements directory when it
-// names the executable; none (logged when malformed) otherwise.
-std::optional<Candidate> directoryDocument(const std::string& path, const std::string& executable,
+// The entitlements of a trusted document of the entitlements directory when
+// it names the running file; none (logged when untrusted or malformed)
+// otherwise.
+std::optional<Candidate> directoryDocument(const std::string& path, const FileIdentity& running,
                                            const TrustSettings& settings) {
-  std::optional<DocumentRead> document = readEntitlementDocument(path, settings);
+  std::optional<tn::Value> document = readTrustedDocument(path, settings);
   if (!document) return std::nullopt;
-  if (!document->value) {
-    logIgnoredDocument(path, reasonOf(document->value.error()));
-    return std::nullopt;
-  }
-  const tn::Value& value = *document->value;
+  const tn::Value& value = *document;
   const std::string* named = value[kExecutableKey].string();
   if (!value.isDictionary() || named == nullptr || !named->starts_with('/') ||
       !value[kEntitlementsKey].isDictionary()) {
@@ -119,46 +115,51 @@ std::optional<Candidate> directoryDocument(const std::string& path, const std::s
                        "\"entitlements\" dictionary");
     return std::nullopt;
   }
-  if (resolvedPath(*named) != executable) return std::nullopt;
-  return Candidate{path, value[kEntitlementsKey], document->trusted};
+  if (fileIdentityAt(*named) != running) return std::nullopt;
+  return Candidate{path, value[kEntitlementsKey]};
 }
 
-std::vector<Candidate> candidatesFor(const std::string& executable, const TrustSettings& settings) {
+std::vector<Candidate> directoryDocuments(const FileIdentity& running, const TrustSettings& settings) {
   std::vector<Candidate> candidates;
-  if (std::optional<Candidate> inBundle = bundleDocument(executable, settings)) {
-    candidates.push_back(std::move(*inBundle));
-  }
   for (const std::string& name : manifestNames(settings.entitlementsDirectory)) {
     const std::string path = bundle::joinPath(settings.entitlementsDirectory, name);
-    if (std::optional<Candidate> named = directoryDocument(path, executable, settings)) {
+    if (std::optional<Candidate> named = directoryDocument(path, running, settings))
       candidates.push_back(std::move(*named));
-    }
   }
   return candidates;
 }
 
 }  // namespace
 
-tn::Value loadEntitlements(const std::string& executablePath, const TrustSettings& settings) {
+tn::Value loadEntitlements(const std::string& executablePath, int executableFd, const TrustSettings& settings) {
   tn::Dictionary granted;
-  if (executablePath.empty()) return granted;
-  const std::string executable = resolvedPath(executablePath);
-  const std::vector<Candidate> candidates = candidatesFor(executable, settings);
-  if (candidates.empty()) return granted;
+  const std::optional<FileIdentity> running = fileIdentityOf(executableFd);
+  if (executablePath.empty() || !running) return granted;
 
-  const tn::Result<void> executableTrusted = checkTrustedPath(executable, settings.daemonUser);
-  if (!executableTrusted) {
-    TN_LOG_ERROR(tn::log::ops(), "ignoring entitlements of executable {}: {}", executable,
-                 reasonOf(executableTrusted.error()));
+  if (const tn::Result<void> trusted = checkTrustedFile(executableFd, settings.daemonUser); !trusted) {
+    // Only the administrator's documents are looked at, to say why they do
+    // not apply; the executable's bundle is not touched.
+    if (!directoryDocuments(*running, settings).empty()) {
+      TN_LOG_ERROR(tn::log::ops(), "ignoring entitlements of executable {}: {}", executablePath,
+                   reasonOf(trusted.error()));
+    }
     return granted;
   }
+  std::vector<Candidate> candidates;
+  if (std::optional<Candidate> inBundle = bundleDocument(executablePath, *running, settings))
+    candidates.push_back(std::move(*inBundle));
+  for (Candidate& named : directoryDocuments(*running, settings)) candidates.push_back(std::move(named));
   for (const Candidate& candidate : candidates) {
-    if (!candidate.trusted) {
-      logIgnoredDocument(candidate.path, reasonOf(candidate.trusted.error()));
-      continue;
-    }
     for (const auto& [key, value] : *candidate.entitlements.dictionary()) granted.set(key, value);
   }
+  return granted;
+}
+
+tn::Value loadEntitlements(const std::string& executablePath, const TrustSettings& settings) {
+  const int fd = ::open(executablePath.c_str(), O_PATH | O_CLOEXEC);
+  if (fd < 0) return tn::Dictionary();
+  tn::Value granted = loadEntitlements(executablePath, fd, settings);
+  ::close(fd);
   return granted;
 }
 

@@ -1,28 +1,38 @@
 #pragma once
 
-// Finding the entitlement documents of an executable, checking them against
-// the trust rule, and merging what they grant.
+// Finding the entitlement documents of a running executable, checking them
+// against the trust rule, and merging what they grant.
 //
 // Documents, in the order they are merged (a later document's value for a
 // key replaces an earlier one's, so an administrator's file in
 // entitlements.d overrides what a bundle ships):
-//   1. <bundle>/Entitlements.manifest of the bundle the executable lies in
-//      (bundle::findEnclosingBundle): a dictionary of entitlements.
+//   1. <bundle>/Entitlements.manifest of the bundle the executable's path
+//      lies in (bundle::findEnclosingBundle): a dictionary of entitlements.
+//      It counts only when the file at the executable's path, as this
+//      process sees it, is the very file the process runs (same device and
+//      inode).
 //   2. Every <name>.manifest in the entitlements directory, in byte order of
 //      the names (names starting with "." are skipped), whose document has
 //      the shape
 //        {"executable": "/usr/bin/tnctl", "entitlements": {"key": value, ...}}
-//      and whose "executable", links resolved, is the executable's path,
-//      links resolved.
+//      and whose "executable", every link followed (a final link too), is
+//      the very file the process runs (same device and inode).
 //
-// Nothing is granted unless the executable itself passes the trust rule; a
-// document counts only when it passes too. Every document that is refused
-// for its contents (unreadable, malformed, not of the shape above) or, when
-// it applies to this executable, for the trust rule, is named on the "ops"
-// log category at error level with the reason:
+// Order of the checks, so that nothing a peer controls is read for an
+// untrusted executable:
+//   - the running file (the open descriptor, not a path) must pass the trust
+//     rule; otherwise nothing is granted, the bundle is not even looked at,
+//     and one line names the executable when a document of entitlements.d
+//     names it;
+//   - each document is checked against the rule on the open file before it
+//     is read; a document that fails is not read (and so, for entitlements.d,
+//     its target is unknown: it is named for every process);
+//   - documents are parsed through the DocumentCache.
+// Refusals are named on the "ops" log category at error level:
 //   "ignoring entitlements in <file>: <reason>"
 //   "ignoring entitlements of executable <path>: <reason>"
-// Documents in entitlements.d naming other executables are skipped quietly.
+// Well-formed documents in entitlements.d naming other executables are
+// skipped quietly.
 
 #include <string>
 
@@ -35,9 +45,17 @@ namespace codesign {
 inline constexpr std::string_view kExecutableKey = "executable";
 inline constexpr std::string_view kEntitlementsKey = "entitlements";
 
-// The merged entitlements the trusted documents grant the executable at
-// executablePath (absolute): always a dictionary value, empty when nothing
-// is granted. Reads the file system; logs as described above.
+// The merged entitlements the trusted documents grant the process running
+// the file open as executableFd (an O_PATH descriptor is enough; it is not
+// read), whose absolute path as this process sees it is executablePath
+// (used to find its bundle and in log lines). Always a dictionary value,
+// empty when nothing is granted or executableFd is negative. Reads the file
+// system; logs as described above.
+tn::Value loadEntitlements(const std::string& executablePath, int executableFd, const TrustSettings& settings);
+
+// The same for an executable that is not running, such as a plug-in's read by
+// the registrar: the file at executablePath (links followed) is the one
+// judged.
 tn::Value loadEntitlements(const std::string& executablePath, const TrustSettings& settings);
 
 }  // namespace codesign

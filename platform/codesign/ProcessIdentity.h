@@ -7,7 +7,10 @@
 #include <sys/types.h>
 
 #include <cstdint>
+#include <optional>
 #include <string>
+
+#include "platform/codesign/FileIdentity.h"
 
 namespace codesign {
 
@@ -19,8 +22,12 @@ struct ProcessIdentity {
   // field 22), which tells a recycled pid from the process.
   uint64_t startTime = 0;
   // Absolute path of the executable, read from /proc/<pid>/exe at connection
-  // time; empty when it could not be read.
+  // time; empty when it could not be read. For finding the bundle and for
+  // logs: what the process runs is executableFile.
   std::string executablePath;
+  // The file the process runs, as opened through /proc/<pid>/exe; none when
+  // it could not be opened (such a process has no entitlements).
+  std::optional<FileIdentity> executableFile;
 };
 
 }  // namespace codesign

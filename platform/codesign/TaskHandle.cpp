@@ -7,13 +7,17 @@
 
 namespace codesign {
 
-TaskHandle::TaskHandle(ProcessIdentity identity) : TaskHandle(std::move(identity), TrustSettings::fromEnvironment()) {}
+TaskHandle::TaskHandle(ProcessIdentity identity, int executableFd)
+    : TaskHandle(std::move(identity), executableFd, TrustSettings::fromEnvironment()) {}
 
-TaskHandle::TaskHandle(ProcessIdentity identity, const TrustSettings& settings)
-    : identity_(std::move(identity)), entitlements_(loadEntitlements(identity_.executablePath, settings)) {}
+TaskHandle::TaskHandle(ProcessIdentity identity, int executableFd, const TrustSettings& settings)
+    : identity_(std::move(identity)),
+      entitlements_(loadEntitlements(identity_.executablePath, executableFd, settings)) {
+  identity_.executableFile = fileIdentityOf(executableFd);
+}
 
 tn::Result<tn::Value> entitlementValue(const TaskHandle& task, std::string_view key) {
-  if (task.identity().executablePath.empty()) {
+  if (task.identity().executablePath.empty() || !task.identity().executableFile) {
     return tn::Error(std::string(kCodesignErrorDomain), static_cast<int64_t>(CodesignErrorCode::NoExecutable),
                      fmt::format("no executable is known for process {}", task.identity().pid));
   }

@@ -4,13 +4,16 @@
 // to one queue and is touched only by blocks running on it. This folder
 // provides them, standing in for the platform's dispatch service:
 //
-//   SerialQueue  a serial queue: async(), sync(), assertOnQueue()
+//   SerialQueue  a serial queue: async(), sync(), assertOnQueue(), lock ranks
+//   FairQueue    a serial queue shared by clients, which takes them in turn
 //   ThreadPool   the shared workers queues run on; BlockingScope for workers
 //                that wait
 //   Semaphore    a counting semaphore
 //   MainLoop     the main thread's loop and the main queue (mainQueue(),
 //                runMainLoop())
 //   QueueTarget  what a queue runs on (pool or main loop)
+//   Poller       an event source the pool's idle workers wait in (the relay's
+//                sockets)
 //   SignalSource a process signal delivered as a block on a queue
 //
 // Programming errors (sync onto the queue you are on, a block run off its
@@ -22,7 +25,9 @@
 
 #pragma once
 
+#include "platform/dispatch/FairQueue.h"
 #include "platform/dispatch/MainLoop.h"
+#include "platform/dispatch/Poller.h"
 #include "platform/dispatch/QueueTarget.h"
 #include "platform/dispatch/Semaphore.h"
 #include "platform/dispatch/SerialQueue.h"

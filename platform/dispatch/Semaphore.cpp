@@ -3,7 +3,17 @@
 #include "platform/dispatch/Fatal.h"
 #include "platform/dispatch/ThreadPool.h"
 
+#include "platform/dispatch/SerialQueue.h"
+
 namespace tn::dispatch {
+namespace {
+
+std::string waitDescription() {
+  const std::string held = SerialQueue::describeHeldQueues();
+  return "a semaphore, holding " + (held.empty() ? std::string("nothing") : held);
+}
+
+}  // namespace
 
 Semaphore::Semaphore(long initial) : count_(initial) {
   if (initial < 0) {
@@ -21,7 +31,7 @@ void Semaphore::wait() {
   std::unique_lock lock(mutex_);
   if (count_ == 0) {
     lock.unlock();
-    const ThreadPool::BlockingScope blocking;
+    const ThreadPool::BlockingScope blocking(waitDescription());
     lock.lock();
     positive_.wait(lock, [this] { return count_ > 0; });
   }
@@ -33,7 +43,7 @@ bool Semaphore::waitFor(std::chrono::milliseconds timeout) {
   std::unique_lock lock(mutex_);
   if (count_ == 0) {
     lock.unlock();
-    const ThreadPool::BlockingScope blocking;
+    const ThreadPool::BlockingScope blocking(waitDescription());
     lock.lock();
     if (!positive_.wait_until(lock, deadline, [this] { return count_ > 0; })) {
       return false;

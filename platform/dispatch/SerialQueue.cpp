@@ -104,6 +104,7 @@ void SerialQueue::drain() {
       block = std::move(items_.front().block);
       items_.pop_front();
     }
+    ThreadPool::willRunBlock();
     try {
       block();
     } catch (const std::exception& error) {
@@ -152,10 +153,36 @@ SerialQueue::SyncScope::SyncScope(SerialQueue& queue) : queue_(acquired(queue)),
 
 SerialQueue::SyncScope::~SyncScope() { queue_.releaseAfterSync(); }
 
+std::string SerialQueue::describeHeldQueues() {
+  std::string text;
+  for (const Held* held = Held::top; held != nullptr; held = held->outer) {
+    if (!text.empty()) text += " > ";
+    text += "'" + held->queue->label_ + "'";
+  }
+  return text;
+}
+
+bool SerialQueue::checksLockOrder() { return TN_CHECK_LOCK_ORDER != 0; }
+
+void SerialQueue::checkLockOrder() const {
+#if TN_CHECK_LOCK_ORDER
+  if (lockRank_ == 0) return;
+  for (const Held* held = Held::top; held != nullptr; held = held->outer) {
+    const int heldRank = held->queue->lockRank_;
+    if (heldRank != 0 && heldRank >= lockRank_) {
+      detail::fatal("lock order: sync onto queue '" + label_ + "' (rank " + std::to_string(lockRank_) +
+                    ") from a thread holding queue '" + held->queue->label_ + "' (rank " +
+                    std::to_string(heldRank) + ")");
+    }
+  }
+#endif
+}
+
 void SerialQueue::acquireForSync() {
   if (isCurrent()) {
     detail::fatal("sync onto queue '" + label_ + "' from a block running on it would deadlock");
   }
+  checkLockOrder();
   std::unique_lock lock(mutex_);
   if (owner_ == Owner::nobody) {
     owner_ = Owner::syncCaller;  // idle and empty: take it here ("inline sync")
@@ -169,7 +196,8 @@ void SerialQueue::acquireForSync() {
   items_.push_back(Item{{}, &barrier});
   lock.unlock();
   // Entered without mutex_ held: the pool may start a thread here.
-  const ThreadPool::BlockingScope blocking;
+  const ThreadPool::BlockingScope blocking("sync onto queue '" + label_ + "' holding " +
+                                           (Held::top ? describeHeldQueues() : std::string("nothing")));
   lock.lock();
   barrier.wakeup.wait(lock, [&barrier] { return barrier.granted; });
 }

@@ -32,6 +32,12 @@
 // - assertOnQueue() aborts unless the calling thread holds this queue (as
 //   above: running one of its blocks, or inside a sync onto it, however deep
 //   in nested syncs). isCurrent() answers the same question.
+// - Lock order: a queue may be given a rank (setLockRank). In builds that
+//   check it (debug and sanitizer builds: TN_CHECK_LOCK_ORDER), a sync onto
+//   a ranked queue from a thread that holds a ranked queue of the same or a
+//   higher rank aborts with "tenon: fatal: lock order: ..." naming both, so
+//   that an order that could deadlock between threads fails on first use,
+//   not in the rare interleaving that hangs. Unranked queues are not checked.
 // - Fairness: a queue with a long backlog gives its thread back to the pool
 //   after a batch of kBatchLimit blocks and queues itself again behind the
 //   other work, so one busy queue cannot starve the others.
@@ -76,6 +82,18 @@ class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
 
   const std::string& label() const { return label_; }
   int qualityOfService() const { return qualityOfService_; }
+
+  // The queue's place in the lock order (see above); 0, the default, means
+  // unranked. Set it before the queue is used.
+  void setLockRank(int rank) { lockRank_ = rank; }
+  int lockRank() const { return lockRank_; }
+
+  // True in builds that check the lock order.
+  static bool checksLockOrder();
+
+  // "'a' (held) > 'b' (held)": the queues the calling thread holds,
+  // innermost first; empty when it holds none. For diagnostics.
+  static std::string describeHeldQueues();
 
   // Enqueues `block` and returns. Any thread, also from a block of this
   // queue.
@@ -150,6 +168,9 @@ class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
   };
 
   void acquireForSync();
+  // Aborts when a sync onto this queue from the calling thread breaks the
+  // lock order (in builds that check it).
+  void checkLockOrder() const;
   void releaseAfterSync();
   // Grants the queue to the barrier at the front, if there is one. Needs
   // mutex_ held and the queue owned by the calling thread.
@@ -163,6 +184,7 @@ class SerialQueue : public std::enable_shared_from_this<SerialQueue> {
 
   const std::string label_;
   const int qualityOfService_;
+  int lockRank_ = 0;
   QueueTarget& target_;
 
   mutable std::mutex mutex_;

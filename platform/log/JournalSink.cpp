@@ -61,7 +61,8 @@ JournalSink::JournalSink() : JournalSink(program_invocation_short_name) {}
 JournalSink::JournalSink(std::string identifier) : identifier_(std::move(identifier)) {}
 
 void JournalSink::write(const Record& record) {
-  // The journal takes "FIELD=value" byte ranges; the text may hold any bytes.
+  // The journal takes "FIELD=value" byte ranges; the log layer escaped the
+  // text already (Escape.h), so it is one line of valid UTF-8.
   const std::string message = "MESSAGE=" + std::string(record.text);
   const std::string priority = "PRIORITY=" + std::to_string(journalPriority(record.level));
   const std::string identifier = "SYSLOG_IDENTIFIER=" + identifier_;

@@ -9,7 +9,8 @@
 // arguments. The log expression is evaluated exactly once. When the level is
 // off for that log object the call costs one branch: no argument is
 // evaluated and nothing is formatted, so arguments may be expensive
-// (descriptions of messages, UUID strings).
+// (descriptions of messages, UUID strings). The format string literal's
+// address identifies the call site to the rate limiter (RateLimiter.h).
 
 #pragma once
 
@@ -22,8 +23,9 @@
   do {                                                                                \
     ::tn::log::Log& tn_log_object_ = (tn_log_);                                       \
     if (tn_log_object_.enabled(tn_level_)) [[unlikely]] {                             \
-      tn_log_object_.write(tn_level_, ::fmt::format(FMT_STRING(tn_format_)            \
-                                                        __VA_OPT__(, ) __VA_ARGS__)); \
+      tn_log_object_.write(tn_level_,                                                 \
+                           ::fmt::format(FMT_STRING(tn_format_) __VA_OPT__(, ) __VA_ARGS__), \
+                           static_cast<const void*>(tn_format_));                     \
     }                                                                                 \
   } while (0)
 

@@ -5,6 +5,8 @@
 #include <unistd.h>
 
 #include "platform/log/Configuration.h"
+#include "platform/log/Escape.h"
+#include "platform/log/LogContext.h"
 #include "platform/log/LevelRegistry.h"
 #include "platform/log/Names.h"
 #include "platform/log/Output.h"
@@ -31,9 +33,44 @@ Log::Log(std::string subsystem, std::string category)
 
 Log::~Log() { LevelRegistry::the().detach(*this); }
 
-void Log::write(Level level, std::string_view text) const {
-  Record record{subsystem_, category_, level, text, std::chrono::system_clock::now(), ::gettid()};
+namespace {
+
+// Every line passes here: escaped once, then handed to the sink.
+void emit(std::string_view subsystem, std::string_view category, Level level, std::string_view text) {
+  std::string escaped;
+  if (needsEscaping(text)) {
+    escaped = escapeText(text);
+    text = escaped;
+  }
+  Record record{subsystem, category, level, text, std::chrono::system_clock::now(), ::gettid()};
   currentSink()->write(record);
+}
+
+}  // namespace
+
+namespace detail {
+
+RateLimiter& rateLimiter() {
+  // Never destroyed: objects with static storage may still log at exit.
+  static auto* limiter = new RateLimiter;
+  return *limiter;
+}
+
+void writeSummaries(const std::vector<RateLimiter::Summary>& summaries) {
+  for (const RateLimiter::Summary& summary : summaries)
+    emit(summary.subsystem, summary.category, summary.level, RateLimiter::summaryText(summary.suppressed));
+}
+
+}  // namespace detail
+
+void Log::write(Level level, std::string_view text, const void* site) const {
+  if (const ContextId context = currentContext(); context != 0 && site != nullptr) {
+    const RateLimiter::Decision decision =
+        detail::rateLimiter().admit(context, site, *this, level, RateLimiter::Clock::now());
+    detail::writeSummaries(decision.summaries);
+    if (!decision.write) return;
+  }
+  emit(subsystem_, category_, level, text);
 }
 
 void Log::setEnabledLevels(unsigned mask) noexcept {

@@ -11,8 +11,10 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "platform/log/Level.h"
+#include "platform/log/RateLimiter.h"
 
 namespace tn::log {
 
@@ -36,9 +38,13 @@ class Log {
            0;
   }
 
-  // Sends `text` at `level` to the current sink, stamped with the time and
-  // the calling thread. Does not test enabled(): callers do (the macros).
-  void write(Level level, std::string_view text) const;
+  // Sends `text` at `level` to the current sink, escaped (Escape.h) and
+  // stamped with the time and the calling thread. Does not test enabled():
+  // callers do (the macros). `site` identifies the call site (the macros
+  // pass their format string literal): inside a client's context
+  // (LogContext.h) the rate limiter may suppress the line (RateLimiter.h);
+  // without a site the line is never suppressed.
+  void write(Level level, std::string_view text, const void* site = nullptr) const;
 
   // Sets which levels are enabled (bit 1 << level). Used by the level
   // settings; default and error stay on whatever `mask` says.
@@ -66,6 +72,11 @@ namespace detail {
 // defaultLog() it does not read TENON_LOG itself, since that code reports
 // problems on this very log.
 Log& defaultLogWithoutConfiguration();
+
+// The process's one rate limiter, and the writer of the summaries it hands
+// back (LogContext.cpp writes those a context owes when it ends).
+RateLimiter& rateLimiter();
+void writeSummaries(const std::vector<RateLimiter::Summary>& summaries);
 
 }  // namespace detail
 

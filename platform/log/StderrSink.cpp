@@ -9,6 +9,9 @@ namespace tn::log {
 namespace {
 
 // Appends `text` with line breaks escaped, keeping the message on one line.
+// The log layer escaped every message already (Escape.h), so this only
+// guards records a program hands to the sink itself; it must not escape
+// again (a backslash would double).
 void appendOneLine(std::string& line, std::string_view text) {
   for (char c : text) {
     if (c == '\n') {

@@ -8,10 +8,12 @@
 // observe.
 //
 // Each name is a small file, $TENON_ROOT/run/tenon/notify/<name>, holding
-// the number of posts so far as decimal text and a newline ("3\n"). A post
-// takes an exclusive lock on the file (flock), adds one and rewrites the
-// number in place; readers take a shared lock, so they never see half a
-// number. The count makes "exactly one notification per post" checkable:
+// the number of posts so far as 20 zero-padded decimal digits and a newline
+// ("00000000000000000003\n"). A post adds one and rewrites the record with
+// one pwrite; readers read without a lock until two reads agree. Posters
+// serialise on ".<name>.lock", a 0600 file of their own; nobody locks the
+// notification file itself, which every user may open (and flock needs only
+// that), so no peer can stall a poster. The count makes "exactly one notification per post" checkable:
 // postCount() before and after tells how many posts happened in between, and
 // an observer delivers one handler call per increment it sees, never
 // coalescing. Observers watch the directory with inotify and re-read the

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <charconv>
 #include <cstring>
+#include <mutex>
 #include <string>
 
 #include <fmt/format.h>
@@ -18,14 +19,22 @@ namespace notify {
 namespace {
 
 constexpr mode_t kFileMode = 0644;
-// "18446744073709551615\n" and a little room to tell a longer text apart.
+// A post writes the count as exactly this many decimal digits (zero-padded)
+// and a newline, in one pwrite at offset 0, so the file's size never changes
+// and a reader never sees a shorter or longer text than a writer wrote.
+constexpr size_t kCounterDigits = 20;  // 18446744073709551615
+constexpr size_t kCounterRecord = kCounterDigits + 1;
+// What a reader reads: a record and a little room to tell a longer text apart.
 constexpr size_t kCounterTextMax = 32;
+// A reader reads until two reads agree (a pwrite that overlaps a pread may
+// show a mix of two counts); past this many tries it takes the last one.
+constexpr int kStableReadTries = 8;
 
 tn::Error fileError(const std::string& path, std::string_view what, int error) {
   return notifyError(NotifyErrorCode::FileSystem, fmt::format("{}: {}: {}", path, what, std::strerror(error)));
 }
 
-// Closes the descriptor (and so releases its lock) when it goes out of scope.
+// Closes the descriptor when it goes out of scope.
 class Descriptor {
  public:
   explicit Descriptor(int fd) : fd_(fd) {}
@@ -40,42 +49,94 @@ class Descriptor {
   int fd_;
 };
 
-tn::Result<void> lock(int fd, int operation, const std::string& path) {
-  while (::flock(fd, operation) != 0) {
-    if (errno != EINTR) return fileError(path, "cannot lock", errno);
-  }
-  return {};
-}
+// Serialises this process's posts, so that posts from its threads each count
+// exactly once. A process-private mutex: no other process can hold it.
+std::mutex gPostMutex;
 
-// The count the text holds: decimal digits, optionally ended by a newline.
-// Anything else counts as zero.
+// Serialises the posts of one name across the poster's own processes: an
+// exclusive flock on "<directory>/.<name>.lock", created with mode 0600. The
+// lock is taken only when the file is a regular file of this user that
+// nobody else may open, so no other user can hold it (flock needs an open
+// descriptor). When it cannot be used (someone else's file, a name too long
+// for the suffix) the post goes on without it: posts of several processes
+// at the same instant may then merge.
+class OwnerLock {
+ public:
+  explicit OwnerLock(std::string_view name) {
+    const std::string path = fmt::format("{}/.{}.lock", notificationDirectory(), name);
+    fd_ = ::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0600);
+    if (fd_ < 0) return;
+    struct stat status {};
+    const bool private_ = ::fstat(fd_, &status) == 0 && S_ISREG(status.st_mode) && status.st_uid == ::geteuid() &&
+                          (status.st_mode & 077) == 0;
+    int locked = -1;
+    while (private_ && (locked = ::flock(fd_, LOCK_EX)) != 0 && errno == EINTR) {
+    }
+    if (locked != 0) {
+      ::close(fd_);
+      fd_ = -1;
+    }
+  }
+  ~OwnerLock() {
+    if (fd_ >= 0) ::close(fd_);  // releases the lock
+  }
+  OwnerLock(const OwnerLock&) = delete;
+  OwnerLock& operator=(const OwnerLock&) = delete;
+
+ private:
+  int fd_ = -1;
+};
+
+// The count the text's first line holds: decimal digits (leading zeros
+// allowed), ended by a newline or the end of the text. Anything else counts
+// as zero.
 uint64_t parseCounter(std::string_view text) {
-  if (text.ends_with('\n')) text.remove_suffix(1);
+  if (const size_t newline = text.find('\n'); newline != std::string_view::npos) text = text.substr(0, newline);
   uint64_t counter = 0;
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), counter);
   if (error != std::errc() || end != text.data() + text.size() || text.empty()) return 0;
   return counter;
 }
 
-tn::Result<uint64_t> readCounter(int fd, const std::string& path) {
+tn::Result<std::string> readText(int fd, const std::string& path) {
   char buffer[kCounterTextMax];
   ssize_t n;
   do {
     n = ::pread(fd, buffer, sizeof buffer, 0);
   } while (n < 0 && errno == EINTR);
   if (n < 0) return fileError(path, "cannot read", errno);
-  return parseCounter(std::string_view(buffer, static_cast<size_t>(n)));
+  return std::string(buffer, static_cast<size_t>(n));
+}
+
+// Reads until two reads agree, without any lock: the writer's one pwrite
+// and our preads may overlap, and a single read could show half of each.
+tn::Result<uint64_t> readCounter(int fd, const std::string& path) {
+  tn::Result<std::string> previous = readText(fd, path);
+  if (!previous) return previous.error();
+  for (int attempt = 1; attempt < kStableReadTries; ++attempt) {
+    tn::Result<std::string> again = readText(fd, path);
+    if (!again) return again.error();
+    if (*again == *previous) break;
+    previous = std::move(again);
+  }
+  return parseCounter(*previous);
 }
 
 tn::Result<void> writeCounter(int fd, uint64_t counter, const std::string& path) {
-  const std::string text = fmt::format("{}\n", counter);
+  const std::string text = fmt::format("{:0{}}\n", counter, kCounterDigits);
   ssize_t n;
   do {
     n = ::pwrite(fd, text.data(), text.size(), 0);
   } while (n < 0 && errno == EINTR);
   if (n < 0) return fileError(path, "cannot write", errno);
   if (static_cast<size_t>(n) != text.size()) return fileError(path, "cannot write", EIO);
-  if (::ftruncate(fd, static_cast<off_t>(text.size())) != 0) return fileError(path, "cannot truncate", errno);
+  // A file longer than a record (an older format, or rewritten by hand) is
+  // cut after the record; readers take the first line meanwhile.
+  struct stat status {};
+  if (::fstat(fd, &status) != 0) return fileError(path, "cannot examine", errno);
+  if (static_cast<size_t>(status.st_size) > kCounterRecord &&
+      ::ftruncate(fd, static_cast<off_t>(kCounterRecord)) != 0)
+    return fileError(path, "cannot truncate", errno);
   return {};
 }
 
@@ -115,7 +176,8 @@ tn::Result<uint64_t> post(std::string_view name) {
   if (!opened) return opened.error();
   const Descriptor fd(*opened);
   if (tn::Result<void> regular = requireRegularFile(fd.get(), path); !regular) return regular.error();
-  if (tn::Result<void> locked = lock(fd.get(), LOCK_EX, path); !locked) return locked.error();
+  const std::lock_guard serialised(gPostMutex);
+  const OwnerLock acrossProcesses(name);
   tn::Result<uint64_t> counter = readCounter(fd.get(), path);
   if (!counter) return counter;
   const uint64_t next = *counter + 1;
@@ -132,7 +194,6 @@ tn::Result<uint64_t> postCount(std::string_view name) {
     return fileError(path, "cannot open", errno);
   }
   if (tn::Result<void> regular = requireRegularFile(fd.get(), path); !regular) return regular.error();
-  if (tn::Result<void> locked = lock(fd.get(), LOCK_SH, path); !locked) return locked.error();
   return readCounter(fd.get(), path);
 }
 

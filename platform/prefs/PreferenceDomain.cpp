@@ -9,6 +9,8 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <mutex>
+#include <unordered_set>
 #include <utility>
 
 #include <fmt/format.h>
@@ -48,6 +50,22 @@ class WriterLock {
   int fd_;
 };
 
+// Directories whose stale temporary files this process removed already: a
+// directory is cleaned the first time the process opens a domain in it.
+// Bounded: past kMaxCleanedDirectories, reads stop cleaning (writers always
+// clean).
+constexpr size_t kMaxCleanedDirectories = 4096;
+
+void removeStaleTemporariesOnce(const std::string& directory) {
+  static std::mutex mutex;
+  static std::unordered_set<std::string> cleaned;
+  {
+    const std::lock_guard lock(mutex);
+    if (cleaned.size() >= kMaxCleanedDirectories || !cleaned.insert(directory).second) return;
+  }
+  (void)tn::removeStaleTemporaryFiles(directory);  // a missing directory has nothing to clean
+}
+
 }  // namespace
 
 PreferenceDomain::PreferenceDomain(std::string name, uid_t uid) : name_(std::move(name)), uid_(uid) {}
@@ -69,6 +87,7 @@ tn::Result<void> PreferenceDomain::checkName() const {
 tn::Result<tn::Dictionary> PreferenceDomain::values() const {
   if (auto valid = checkName(); !valid.ok()) return valid.error();
   const std::string file = path();
+  removeStaleTemporariesOnce(std::filesystem::path(file).parent_path().string());
   struct stat status {};
   if (::stat(file.c_str(), &status) != 0 && (errno == ENOENT || errno == ENOTDIR)) return tn::Dictionary();
   tn::Result<tn::Value> document = tn::readDocumentFile(file);
@@ -104,6 +123,9 @@ tn::Result<void> PreferenceDomain::setValue(std::string_view key, const std::opt
     return preferencesError(PreferencesErrorCode::WriteFailed,
                             fmt::format("{}.lock: {}", file.string(), std::strerror(errno)));
   }
+  // Saves of this domain that died left their temporary files; ours, under
+  // the lock, is not made yet, and other domains' live writers keep theirs.
+  (void)tn::removeStaleTemporaryFiles(file.parent_path().string());
   // A damaged file is replaced rather than kept: the write is the user's
   // newest intent.
   tn::Result<tn::Dictionary> existing = values();

@@ -12,6 +12,10 @@
 // per domain (an flock on "<domain>.manifest.lock" beside it), so that two
 // writers of different keys do not lose each other's change.
 //
+// Temporary files that writers killed during a save left in a user's
+// directory are removed when a writer writes there, and the first time this
+// process reads a domain there (writers still alive keep theirs).
+//
 // A missing file or directory is an empty domain. A file that cannot be read
 // or parsed, or whose root is not a dictionary, is an error naming the file;
 // writing over such a file replaces it.

@@ -316,6 +316,10 @@ class Scanner {
   ReadContext context_;
 };
 
+// A path with a NUL names nothing: the file system would see only the part
+// before it, which may be another bundle.
+bool namesNothing(const std::string& path) { return path.find('\0') != std::string::npos; }
+
 std::string resolvedPath(const std::string& path) {
   char resolved[PATH_MAX];
   if (::realpath(path.c_str(), resolved) != nullptr) return resolved;
@@ -386,6 +390,7 @@ PlugInPtr Registrar::plugInForURL(const tn::URL& url) const {
   if (!url.isFileURL() && !url.scheme().empty()) return nullptr;
   const StatePtr current = state();
   const std::string path = normalisedPath(url);
+  if (namesNothing(path)) return nullptr;
   if (auto found = current->plugIns.find(path); found != current->plugIns.end()) return found->second;
   if (auto found = current->plugIns.find(resolvedPath(path)); found != current->plugIns.end()) return found->second;
   return nullptr;
@@ -395,6 +400,7 @@ AppPtr Registrar::applicationForURL(const tn::URL& url) const {
   if (!url.isFileURL() && !url.scheme().empty()) return nullptr;
   const StatePtr current = state();
   const std::string path = normalisedPath(url);
+  if (namesNothing(path)) return nullptr;
   if (auto found = current->apps.find(path); found != current->apps.end()) return found->second;
   if (auto found = current->apps.find(resolvedPath(path)); found != current->apps.end()) return found->second;
   return nullptr;
@@ -643,6 +649,7 @@ tn::Result<void> Registrar::registerPlugIn(const tn::URL& url) {
     return registrarError(RegistrarErrorCode::ReadOnly, "the registrar was opened read-only");
   }
   const std::string path = normalisedPath(url);
+  if (namesNothing(path)) return registrarError(RegistrarErrorCode::NotFound, "a path with a NUL names nothing");
   return queue_->sync([&]() -> tn::Result<void> {
     std::string reason;
     if (!isDirectory(path, &reason)) {
@@ -680,6 +687,7 @@ tn::Result<void> Registrar::unregisterPlugIn(const tn::URL& url) {
     return registrarError(RegistrarErrorCode::ReadOnly, "the registrar was opened read-only");
   }
   const std::string path = normalisedPath(url);
+  if (namesNothing(path)) return registrarError(RegistrarErrorCode::NotFound, "a path with a NUL names nothing");
   return queue_->sync([&]() -> tn::Result<void> {
     const StatePtr current = state();
     const auto known = current->storedPlugIns.find(path);

@@ -53,39 +53,66 @@ class Statement {
   bool ok() const { return statement_ != nullptr; }
   sqlite3_stmt* get() const { return statement_; }
 
+  // Every bind goes through the 64-bit variants (a size is never narrowed)
+  // and is checked: the first failure is kept, and run() then refuses to
+  // step, so a row is never written with a parameter missing.
   void bindText(int index, std::string_view text) {
-    sqlite3_bind_text(statement_, index, text.data(), static_cast<int>(text.size()), SQLITE_TRANSIENT);
+    // A null pointer would bind NULL, not an empty text.
+    const char* bytes = text.data() != nullptr ? text.data() : "";
+    check(sqlite3_bind_text64(statement_, index, bytes, text.size(), SQLITE_TRANSIENT, SQLITE_UTF8));
   }
   void bindOptionalText(int index, const std::optional<std::string>& text) {
     if (text) {
       bindText(index, *text);
     } else {
-      sqlite3_bind_null(statement_, index);
+      check(sqlite3_bind_null(statement_, index));
     }
   }
   void bindBlob(int index, const void* bytes, size_t size) {
-    sqlite3_bind_blob(statement_, index, bytes, static_cast<int>(size), SQLITE_TRANSIENT);
+    check(sqlite3_bind_blob64(statement_, index, bytes, size, SQLITE_TRANSIENT));
   }
   void bindValue(int index, const tn::Value& value) {
     const tn::Bytes bytes = tn::encodeCbor(value, tn::CborDialect::Typed);
     bindBlob(index, bytes.data(), bytes.size());
   }
   void bindUUID(int index, const tn::UUID& uuid) { bindBlob(index, uuid.bytes().data(), uuid.bytes().size()); }
-  void bindInt(int index, int64_t value) { sqlite3_bind_int64(statement_, index, value); }
-  void bindReal(int index, double value) { sqlite3_bind_double(statement_, index, value); }
+  void bindInt(int index, int64_t value) { check(sqlite3_bind_int64(statement_, index, value)); }
+  void bindReal(int index, double value) { check(sqlite3_bind_double(statement_, index, value)); }
 
-  // Runs a statement that returns no rows; false on failure.
+  // Runs a statement that returns no rows; false on failure (of a bind or
+  // of the step), with the reason in the database's error message.
   bool run() {
-    const int result = sqlite3_step(statement_);
+    const int result = bound_ == SQLITE_OK ? sqlite3_step(statement_) : bound_;
     sqlite3_reset(statement_);
     sqlite3_clear_bindings(statement_);
+    bound_ = SQLITE_OK;
     return result == SQLITE_DONE;
+  }
+
+ private:
+  void check(int result) {
+    if (bound_ == SQLITE_OK && result != SQLITE_OK) bound_ = result;
   }
 
  private:
   sqlite3* db_;
   sqlite3_stmt* statement_ = nullptr;
+  int bound_ = SQLITE_OK;  // the first bind failure since the last run
 };
+
+// Steps a query to its end, calling row for each row while row answers
+// true. True when the query ran to its end (SQLITE_DONE): a step that fails
+// part-way (a damaged page, a full disk) is an error, never a shorter
+// answer.
+template <typename Row>
+bool eachRow(Statement& statement, Row row) {
+  if (!statement.ok()) return false;
+  int result;
+  while ((result = sqlite3_step(statement.get())) == SQLITE_ROW) {
+    if (!row(statement.get())) return false;
+  }
+  return result == SQLITE_DONE;
+}
 
 std::string columnText(sqlite3_stmt* statement, int column) {
   const unsigned char* text = sqlite3_column_text(statement, column);
@@ -227,6 +254,8 @@ Store::Store(std::string path, sqlite3* db) : path_(std::move(path)), db_(db) {}
 
 Store::~Store() { sqlite3_close(db_); }
 
+void Store::limitValueSize(int bytes) { sqlite3_limit(db_, SQLITE_LIMIT_LENGTH, bytes); }
+
 tn::Result<Store::Opened> Store::open(const std::string& path, Mode mode) {
   if (mode == Mode::ReadOnly) {
     struct stat info {};
@@ -245,6 +274,25 @@ tn::Result<Store::Opened> Store::open(const std::string& path, Mode mode) {
   return rebuilt;
 }
 
+// One row of the plug-ins query, or none when its values do not decode.
+static std::optional<StoredPlugIn> plugInOfRow(sqlite3_stmt* row) {
+  StoredPlugIn plugIn;
+  plugIn.path = columnText(row, 1);
+  const std::optional<tn::UUID> uuid = columnUUID(row, 0);
+  if (!uuid || !columnValue(row, 5, plugIn.info) || !columnValue(row, 6, plugIn.entitlements) ||
+      !columnValue(row, 7, plugIn.localizations)) {
+    return std::nullopt;
+  }
+  plugIn.uuid = *uuid;
+  plugIn.appPath = columnOptionalText(row, 2);
+  plugIn.registeredByURL = sqlite3_column_int(row, 3) != 0;
+  plugIn.identifier = columnText(row, 4);
+  plugIn.container = columnOptionalText(row, 8);
+  plugIn.registered = tn::Date{sqlite3_column_double(row, 9)};
+  plugIn.fingerprint = columnText(row, 10);
+  return plugIn;
+}
+
 tn::Result<Store::Contents> Store::load() {
   Contents contents;
   if (!execute(db_, "BEGIN")) return storeError(db_, "cannot read the store");
@@ -253,67 +301,59 @@ tn::Result<Store::Contents> Store::load() {
     execute(db_, "ROLLBACK");
     return error;
   };
-  {
-    Statement knowledge(db_, "SELECT value FROM meta WHERE key = 'knowledge'");
-    if (!knowledge.ok()) return fail("cannot read the knowledge");
-    if (sqlite3_step(knowledge.get()) == SQLITE_ROW) {
-      contents.knowledge = columnUUID(knowledge.get(), 0).value_or(tn::UUID());
+  Statement knowledge(db_, "SELECT value FROM meta WHERE key = 'knowledge'");
+  const bool readKnowledge = eachRow(knowledge, [&](sqlite3_stmt* row) {
+    contents.knowledge = columnUUID(row, 0).value_or(tn::UUID());
+    return true;
+  });
+  if (!readKnowledge) return fail("cannot read the knowledge");
+
+  std::string damaged;  // the record that did not decode
+  Statement apps(db_, "SELECT path, placeholder, info, localizations, fingerprint FROM applications");
+  const bool readApps = eachRow(apps, [&](sqlite3_stmt* row) {
+    StoredApp app;
+    app.path = columnText(row, 0);
+    app.placeholder = sqlite3_column_int(row, 1) != 0;
+    app.fingerprint = columnText(row, 4);
+    if (!columnValue(row, 2, app.info) || !columnValue(row, 3, app.localizations)) {
+      damaged = fmt::format("damaged record of application {}", app.path);
+      return false;
     }
-  }
-  {
-    Statement apps(db_, "SELECT path, placeholder, info, localizations, fingerprint FROM applications");
-    if (!apps.ok()) return fail("cannot read applications");
-    while (sqlite3_step(apps.get()) == SQLITE_ROW) {
-      StoredApp app;
-      app.path = columnText(apps.get(), 0);
-      app.placeholder = sqlite3_column_int(apps.get(), 1) != 0;
-      app.fingerprint = columnText(apps.get(), 4);
-      if (!columnValue(apps.get(), 2, app.info) || !columnValue(apps.get(), 3, app.localizations)) {
-        return fail(fmt::format("damaged record of application {}", app.path));
-      }
-      contents.apps.push_back(std::move(app));
+    contents.apps.push_back(std::move(app));
+    return true;
+  });
+  if (!readApps) return fail(damaged.empty() ? "cannot read applications" : damaged);
+
+  Statement plugIns(db_,
+                    "SELECT uuid, path, app_path, registered_by_url, identifier, info, entitlements, "
+                    "localizations, container, registered, fingerprint FROM plugins");
+  contents.plugIns.reserve(16384);
+  const bool readPlugIns = eachRow(plugIns, [&](sqlite3_stmt* row) {
+    std::optional<StoredPlugIn> plugIn = plugInOfRow(row);
+    if (!plugIn) {
+      damaged = fmt::format("damaged record of plug-in {}", columnText(row, 1));
+      return false;
     }
-  }
-  {
-    Statement plugIns(db_,
-                      "SELECT uuid, path, app_path, registered_by_url, identifier, info, entitlements, "
-                      "localizations, container, registered, fingerprint FROM plugins");
-    if (!plugIns.ok()) return fail("cannot read plug-ins");
-    contents.plugIns.reserve(16384);
-    while (sqlite3_step(plugIns.get()) == SQLITE_ROW) {
-      sqlite3_stmt* row = plugIns.get();
-      StoredPlugIn plugIn;
-      plugIn.path = columnText(row, 1);
-      const std::optional<tn::UUID> uuid = columnUUID(row, 0);
-      if (!uuid || !columnValue(row, 5, plugIn.info) || !columnValue(row, 6, plugIn.entitlements) ||
-          !columnValue(row, 7, plugIn.localizations)) {
-        return fail(fmt::format("damaged record of plug-in {}", plugIn.path));
-      }
-      plugIn.uuid = *uuid;
-      plugIn.appPath = columnOptionalText(row, 2);
-      plugIn.registeredByURL = sqlite3_column_int(row, 3) != 0;
-      plugIn.identifier = columnText(row, 4);
-      plugIn.container = columnOptionalText(row, 8);
-      plugIn.registered = tn::Date{sqlite3_column_double(row, 9)};
-      plugIn.fingerprint = columnText(row, 10);
-      contents.plugIns.push_back(std::move(plugIn));
+    contents.plugIns.push_back(std::move(*plugIn));
+    return true;
+  });
+  if (!readPlugIns) return fail(damaged.empty() ? "cannot read plug-ins" : damaged);
+
+  Statement points(db_, "SELECT identifier, path, sdk, fingerprint FROM extension_points");
+  const bool readPoints = eachRow(points, [&](sqlite3_stmt* row) {
+    StoredExtensionPoint point;
+    point.identifier = columnText(row, 0);
+    point.path = columnText(row, 1);
+    point.fingerprint = columnText(row, 3);
+    if (!columnValue(row, 2, point.sdk)) {
+      damaged = fmt::format("damaged record of extension point {}", point.identifier);
+      return false;
     }
-  }
-  {
-    Statement points(db_, "SELECT identifier, path, sdk, fingerprint FROM extension_points");
-    if (!points.ok()) return fail("cannot read extension points");
-    while (sqlite3_step(points.get()) == SQLITE_ROW) {
-      StoredExtensionPoint point;
-      point.identifier = columnText(points.get(), 0);
-      point.path = columnText(points.get(), 1);
-      point.fingerprint = columnText(points.get(), 3);
-      if (!columnValue(points.get(), 2, point.sdk)) {
-        return fail(fmt::format("damaged record of extension point {}", point.identifier));
-      }
-      contents.extensionPoints.push_back(std::move(point));
-    }
-  }
-  execute(db_, "COMMIT");
+    contents.extensionPoints.push_back(std::move(point));
+    return true;
+  });
+  if (!readPoints) return fail(damaged.empty() ? "cannot read extension points" : damaged);
+  if (!execute(db_, "COMMIT")) return fail("cannot finish reading the store");
   return contents;
 }
 
@@ -327,9 +367,12 @@ tn::Result<void> Store::apply(const Changes& changes) {
   };
   {
     Statement knowledge(db_, "SELECT value FROM meta WHERE key = 'knowledge'");
-    if (!knowledge.ok()) return fail("cannot read the knowledge");
     tn::UUID current;
-    if (sqlite3_step(knowledge.get()) == SQLITE_ROW) current = columnUUID(knowledge.get(), 0).value_or(tn::UUID());
+    const bool readKnowledge = eachRow(knowledge, [&](sqlite3_stmt* row) {
+      current = columnUUID(row, 0).value_or(tn::UUID());
+      return true;
+    });
+    if (!readKnowledge) return fail("cannot read the knowledge");
     if (current != changes.expectedKnowledge) {
       execute(db_, "ROLLBACK");
       return registrarError(RegistrarErrorCode::StaleKnowledge,

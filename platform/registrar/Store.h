@@ -85,9 +85,18 @@ class Store {
              removedPlugIns.empty() && putExtensionPoints.empty() && removedExtensionPoints.empty();
     }
   };
+  // Every value is bound with its full 64-bit size and every bind and step
+  // is checked: a failure (a value over the size limit, a full disk, a
+  // damaged page) is a Store error naming the record and SQLite's reason,
+  // and nothing of the write is kept.
   tn::Result<void> apply(const Changes& changes);
 
-  // Reads everything again (after StaleKnowledge).
+  // The largest text or blob a write may store, in bytes (SQLite's length
+  // limit, 1,000,000,000 unless lowered). A larger value fails its write.
+  void limitValueSize(int bytes);
+
+  // Reads everything again (after StaleKnowledge). A read that fails
+  // part-way is an error, never a shorter answer.
   tn::Result<Contents> load();
 
   const std::string& path() const { return path_; }

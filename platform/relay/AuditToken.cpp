@@ -6,6 +6,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <charconv>
@@ -17,9 +18,12 @@
 #include "platform/relay/ProcessStartTime.h"
 #include "platform/relay/RelayError.h"
 
-// Older C library headers lack the option; the kernel's number is stable.
+// Older C library headers lack the options; the kernel's numbers are stable.
 #ifndef SO_PEERPIDFD
 #define SO_PEERPIDFD 77
+#endif
+#ifndef SO_PEERGROUPS
+#define SO_PEERGROUPS 59
 #endif
 
 namespace relay {
@@ -62,6 +66,23 @@ std::optional<long> pidOfPidfd(int pidfd) {
   const auto [ptr, ec] = std::from_chars(text.data() + at, text.data() + text.size(), pid);
   if (ec != std::errc() || ptr == text.data() + at) return std::nullopt;
   return pid;
+}
+
+// The supplementary groups the peer had when it connected. The kernel says
+// how many there are when the buffer is too small (ERANGE), so a second call
+// gets them all; none when the kernel has no SO_PEERGROUPS.
+std::vector<gid_t> peerGroups(int socketFd) {
+  std::vector<gid_t> groups(32);
+  for (int attempt = 0; attempt < 2; ++attempt) {
+    socklen_t size = static_cast<socklen_t>(groups.size() * sizeof(gid_t));
+    if (::getsockopt(socketFd, SOL_SOCKET, SO_PEERGROUPS, groups.data(), &size) == 0) {
+      groups.resize(size / sizeof(gid_t));
+      return groups;
+    }
+    if (errno != ERANGE) break;
+    groups.resize(size / sizeof(gid_t) + 1);
+  }
+  return {};
 }
 
 // A pidfd becomes readable when its process exits.
@@ -114,6 +135,7 @@ tn::Result<AuditToken> AuditToken::ofSocketPeer(int socketFd) {
   token.pid = credentials.pid;
   token.uid = credentials.uid;
   token.gid = credentials.gid;
+  token.groups = peerGroups(socketFd);
   const std::optional<uint64_t> startBefore = processStartTime(token.pid);
   if (tn::Result<void> attached = attachPidfd(token, socketFd, startBefore); !attached.ok()) {
     return attached.error();
@@ -125,6 +147,10 @@ tn::Result<AuditToken> AuditToken::ofSocketPeer(int socketFd) {
     return unidentified(fmt::format("the peer process {} has exited", token.pid));
   }
   return token;
+}
+
+bool AuditToken::isMemberOf(gid_t group) const {
+  return gid == group || std::find(groups.begin(), groups.end(), group) != groups.end();
 }
 
 bool AuditToken::stillSameProcess() const {

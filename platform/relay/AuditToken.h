@@ -1,7 +1,8 @@
 // AuditToken: who the process at the other end of a connection is.
 //
 // pid, uid and gid come from SO_PEERCRED (the credentials the peer had when
-// it connected). A pid alone can be reused once its process is gone, so the
+// it connected), its supplementary groups from SO_PEERGROUPS (also as of
+// connect()). A pid alone can be reused once its process is gone, so the
 // token also carries the process's start time (ProcessStartTime.h) and a
 // pidfd, a handle on that very process which no other process can take
 // over:
@@ -27,6 +28,7 @@
 #include <cstdint>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "platform/relay/UniqueFd.h"
 #include "platform/value/Result.h"
@@ -39,6 +41,9 @@ struct AuditToken {
   pid_t pid = 0;
   uid_t uid = 0;
   gid_t gid = 0;
+  // Supplementary groups (SO_PEERGROUPS), in the kernel's order; empty when
+  // the peer has none or the kernel does not report them.
+  std::vector<gid_t> groups;
   uint64_t startTime = 0;  // clock ticks since boot, /proc/<pid>/stat field 22
   // Null only when the kernel has no pidfds at all.
   std::shared_ptr<const UniqueFd> pidfd;
@@ -49,6 +54,9 @@ struct AuditToken {
   // credentials, PeerUnidentified when the peer is gone or the checks
   // disagree.
   static tn::Result<AuditToken> ofSocketPeer(int socketFd);
+
+  // True when gid is the primary group or one of the supplementary groups.
+  bool isMemberOf(gid_t group) const;
 
   // True while the process this token names is still running: its pidfd
   // does not report an exit and /proc/<pid> shows the same start time. A

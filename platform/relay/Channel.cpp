@@ -11,7 +11,7 @@
 
 #include <fmt/format.h>
 
-#include "platform/relay/IoThread.h"
+#include "platform/relay/IoContext.h"
 #include "platform/relay/RelayError.h"
 
 namespace relay::detail {
@@ -64,12 +64,12 @@ void Channel::start() {
   });
 }
 
-bool Channel::send(tn::Bytes frame, PendingReply* pending) {
+bool Channel::send(tn::Bytes frame, PendingReply* pending, std::shared_ptr<const void> whenSent) {
   const std::lock_guard lock(mutex_);
   if (closing_ || closed_) return false;
   setFrameId(frame, ++lastSentId_);
   if (pending != nullptr) pending_.add(lastSentId_, std::move(*pending));
-  outgoing_.append(std::move(frame));
+  outgoing_.append(std::move(frame), 0, std::move(whenSent));
   if (writeArmed_) {
     // The I/O thread is waiting to write what is queued ahead; keep order.
     if (outgoing_.size() > kMaxOutgoingBytes) {
@@ -105,7 +105,7 @@ void Channel::requestCloseLocked(CloseCause cause, std::string reason) {
 
 void Channel::handled(std::size_t frameLength) {
   if (budget_.release(frameLength)) {
-    asio::post(ioContext(), [self = shared_from_this()] { self->armRead(); });
+    asio::post(ioContext(), [self = shared_from_this()] { self->continueReading(); });
   }
 }
 
@@ -148,14 +148,36 @@ void Channel::onReadable() {
     if (wouldBlock(errno)) break;
     return closeNow(CloseCause::PeerClosed, describeErrno("read", errno));
   }
-  if (budget_.exhausted() && budget_.pause()) return;  // handled() resumes
-  armRead();
+  continueReading();
+}
+
+void Channel::continueReading() {
+  for (;;) {
+    if (closedOnIoThread_) return;
+    while (!heldRequests_.empty() && !budget_.exhausted()) {
+      RawFrame frame = std::move(heldRequests_.front());
+      heldRequests_.pop_front();
+      deliverRequest(std::move(frame));
+    }
+    if (heldRequests_.empty() && !budget_.exhausted()) return armRead();
+    if (budget_.pause()) return;  // handled() resumes
+    // The owner caught up while we looked: go on at once.
+  }
+}
+
+void Channel::deliverRequest(RawFrame frame) {
+  budget_.charge(frame.body.size() + kFrameIdsSize);
+  callbacks_.request(shared_from_this(), std::move(frame));
 }
 
 bool Channel::dispatch(RawFrame frame) {
   if (frame.replyTo == 0) {
-    budget_.charge(frame.body.size() + kFrameIdsSize);
-    callbacks_.request(shared_from_this(), std::move(frame));
+    // Requests keep their order: once one waits, the later ones wait too.
+    if (budget_.exhausted() || !heldRequests_.empty()) {
+      heldRequests_.push_back(std::move(frame));
+    } else {
+      deliverRequest(std::move(frame));
+    }
     return true;
   }
   std::optional<PendingReply> pending;
@@ -233,6 +255,7 @@ int Channel::writeQueuedLocked() {
 void Channel::closeNow(CloseCause cause, const std::string& reason) {
   if (closedOnIoThread_) return;
   closedOnIoThread_ = true;
+  heldRequests_.clear();
   std::vector<PendingReply> orphans;
   std::shared_ptr<void> lease;
   {

@@ -21,6 +21,7 @@
 #include <asio/posix/stream_descriptor.hpp>
 #include <cstddef>
 #include <cstdint>
+#include <deque>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -49,7 +50,10 @@ class Channel : public std::enable_shared_from_this<Channel> {
  public:
   struct Callbacks {
     // I/O thread. A request arrived; it is charged to the budget and the
-    // owner must call handled(frame length) once its handler has run.
+    // owner must call handled(frame length) once it is done with it. While
+    // the budget is exhausted, requests already read wait in the channel
+    // (at most one read's worth) and are not handed out, so the owner never
+    // holds more than the message limit.
     std::function<void(const std::shared_ptr<Channel>&, RawFrame)> request;
     // I/O thread, exactly once, after the socket is closed. Returns the
     // error that the channel's pending reply handlers then receive.
@@ -70,9 +74,11 @@ class Channel : public std::enable_shared_from_this<Channel> {
 
   // Numbers `frame` (encoded with id 0) and sends it after everything sent
   // before it. With `pending`, its handler is registered for the reply
-  // before a byte leaves, and moved from. Returns false once the channel is
-  // closed; then nothing is sent and `pending` is left as it was. Any thread.
-  bool send(tn::Bytes frame, PendingReply* pending = nullptr);
+  // before a byte leaves, and moved from. `whenSent` is released once the
+  // kernel has taken the whole frame, or the channel closed. Returns false
+  // once the channel is closed; then nothing is sent and `pending` is left
+  // as it was. Any thread.
+  bool send(tn::Bytes frame, PendingReply* pending = nullptr, std::shared_ptr<const void> whenSent = nullptr);
 
   // Closes the socket with `cause` unless it is closed already: the
   // callbacks' closed() runs and every pending reply handler receives its
@@ -96,6 +102,10 @@ class Channel : public std::enable_shared_from_this<Channel> {
   void armRead();
   void onReadable();
   bool dispatch(RawFrame frame);
+  // Hands out held requests while the budget allows, then reads on, or
+  // pauses until handled() frees enough of the budget.
+  void continueReading();
+  void deliverRequest(RawFrame frame);
   void deliverReply(PendingReply pending, RawFrame frame);
   void armWrite();
   void flush();
@@ -114,6 +124,7 @@ class Channel : public std::enable_shared_from_this<Channel> {
 
   // I/O thread only.
   FrameReader reader_;
+  std::deque<RawFrame> heldRequests_;  // read while the budget was exhausted
   bool started_ = false;
   bool readArmed_ = false;
   bool closedOnIoThread_ = false;

@@ -71,17 +71,18 @@ tn::Result<std::shared_ptr<Connection>> Connection::connectToService(
   if (!opened.ok()) return opened.error();
   auto connection = std::make_shared<Connection>(CreateTag{}, Role::Client, std::move(serviceName),
                                                  std::move(eventQueue), std::move(opened.value().identity));
-  connection->channel_ = connection->makeChannel(std::move(opened.value().socket), nullptr);
+  connection->channel_ = connection->makeChannel(std::move(opened.value().socket), nullptr,
+                                                 detail::InboundLimits{}.messages);
   return connection;
 }
 
 std::shared_ptr<Connection> Connection::accepted(UniqueFd socket, PeerIdentity identity, std::string serviceName,
-                                                 std::shared_ptr<void> lease) {
+                                                 std::shared_ptr<void> lease, std::size_t maxOutstandingRequests) {
   auto eventQueue = tn::dispatch::SerialQueue::create(
       fmt::format("relay.{}.{}", serviceName, identity.auditToken.pid));
   auto connection = std::make_shared<Connection>(CreateTag{}, Role::Server, std::move(serviceName),
                                                  std::move(eventQueue), std::move(identity));
-  connection->channel_ = connection->makeChannel(std::move(socket), std::move(lease));
+  connection->channel_ = connection->makeChannel(std::move(socket), std::move(lease), maxOutstandingRequests);
   return connection;
 }
 
@@ -102,7 +103,8 @@ Connection::~Connection() {
   }
 }
 
-std::shared_ptr<Channel> Connection::makeChannel(UniqueFd socket, std::shared_ptr<void> lease) {
+std::shared_ptr<Channel> Connection::makeChannel(UniqueFd socket, std::shared_ptr<void> lease,
+                                                std::size_t maxInboundMessages) {
   Channel::Callbacks callbacks;
   const std::weak_ptr<Connection> weak = weak_from_this();
   callbacks.request = [weak](const std::shared_ptr<Channel>& channel, RawFrame frame) {
@@ -117,7 +119,9 @@ std::shared_ptr<Channel> Connection::makeChannel(UniqueFd socket, std::shared_pt
     if (const auto self = weak.lock()) return self->channelClosed(channel, cause, reason);
     return makeRelayError(RelayErrorCode::ConnectionInvalid, reason);
   };
-  return Channel::create(std::move(socket), std::move(callbacks), std::move(lease));
+  detail::InboundLimits limits;
+  limits.messages = maxInboundMessages;
+  return Channel::create(std::move(socket), std::move(callbacks), std::move(lease), limits);
 }
 
 void Connection::setEventHandler(EventHandler handler) { eventHandler_ = std::move(handler); }
@@ -179,18 +183,30 @@ void Connection::sendWithReply(tn::Value body, std::shared_ptr<tn::dispatch::Ser
 }
 
 bool Connection::sendReply(const Message& request, tn::Value reply) {
+  tn::Result<void> sent = trySendReply(request, std::move(reply));
+  if (!sent && !isRelayError(sent.error(), RelayErrorCode::ConnectionInvalid)) {
+    TN_LOG_ERROR(tn::log::traffic(), "{}: reply to {} not sent: {}", description(), request.id,
+                 sent.error().description());
+  }
+  return sent.ok();
+}
+
+tn::Result<void> Connection::trySendReply(const Message& request, tn::Value reply) {
   const std::shared_ptr<Channel> channel = request.channel.lock();
   {
     const std::lock_guard lock(mutex_);
-    if (!channel || channel != channel_ || request.id == 0) return false;
+    if (!channel || channel != channel_ || request.id == 0) {
+      return makeRelayError(RelayErrorCode::ConnectionInvalid, "the request's connection is gone");
+    }
   }
   tn::Result<tn::Bytes> frame = encodeFrame(reply, request.id);
-  if (!frame.ok()) {
-    TN_LOG_ERROR(tn::log::traffic(), "{}: reply to {} not sent: {}", description(), request.id,
-                 frame.error().description());
-    return false;
+  if (!frame.ok()) return frame.error();
+  // The request keeps its share of the budget until its reply has left: a
+  // peer that does not read its replies stops being read itself.
+  if (!channel->send(std::move(*frame), nullptr, request.charge)) {
+    return makeRelayError(RelayErrorCode::ConnectionInvalid, "the connection closed");
   }
-  return channel->send(std::move(*frame));
+  return {};
 }
 
 std::shared_ptr<Channel> Connection::channelForSending(tn::Error& error) {
@@ -217,7 +233,8 @@ std::shared_ptr<Channel> Connection::reconnect(tn::Error& error) {
                            opened.error().message().value_or(opened.error().description()));
     return nullptr;
   }
-  std::shared_ptr<Channel> channel = makeChannel(std::move(opened.value().socket), nullptr);
+  std::shared_ptr<Channel> channel =
+      makeChannel(std::move(opened.value().socket), nullptr, detail::InboundLimits{}.messages);
   bool installed = false;
   bool start = false;
   {
@@ -293,20 +310,23 @@ void Connection::deliverTerminationImminent() {
 }
 
 void Connection::handleRequest(const std::shared_ptr<Channel>& channel, uint64_t id, const tn::Bytes& body) {
-  if (!stopDelivering_) {
-    tn::Result<tn::Value> decoded = decodeFrameBody(body);
-    if (!decoded.ok()) {
-      // Nothing the peer sent after a malformed frame is delivered.
-      stopDelivering_ = true;
-      channel->close(CloseCause::ProtocolViolation, decoded.error().message().value_or(""));
-    } else if (eventHandler_) {
-      Event event;
-      event.kind = Event::Kind::Message;
-      event.message = Message{id, std::move(*decoded), channel};
-      eventHandler_(event);
-    }
+  // The request holds its share of the budget until its last copy is gone:
+  // an owner that keeps it until it has answered limits what a peer can
+  // have outstanding (Message::charge).
+  const std::size_t length = body.size() + kFrameIdsSize;
+  std::shared_ptr<const void> charge(nullptr, [channel, length](const void*) { channel->handled(length); });
+  if (stopDelivering_) return;
+  tn::Result<tn::Value> decoded = decodeFrameBody(body);
+  if (!decoded.ok()) {
+    // Nothing the peer sent after a malformed frame is delivered.
+    stopDelivering_ = true;
+    channel->close(CloseCause::ProtocolViolation, decoded.error().message().value_or(""));
+  } else if (eventHandler_) {
+    Event event;
+    event.kind = Event::Kind::Message;
+    event.message = Message{id, std::move(*decoded), channel, std::move(charge)};
+    eventHandler_(event);
   }
-  channel->handled(body.size() + kFrameIdsSize);
 }
 
 void Connection::handleEvent(const Event& event) {
@@ -331,6 +351,11 @@ pid_t Connection::pid() const {
 std::string Connection::executablePath() const {
   const std::lock_guard lock(mutex_);
   return identity_.executablePath;
+}
+
+PeerIdentity Connection::peerIdentity() const {
+  const std::lock_guard lock(mutex_);
+  return identity_;
 }
 
 std::string Connection::description() const {

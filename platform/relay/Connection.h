@@ -110,11 +110,19 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // id ends the connection at the peer.
   bool sendReply(const Message& request, tn::Value reply);
 
+  // sendReply, telling why nothing was sent: ConnectionInvalid (the
+  // connection or its socket is gone), MessageTooLarge (the reply does not
+  // fit in a frame: the caller may still answer with something smaller) or
+  // NotAMessage.
+  tn::Result<void> trySendReply(const Message& request, tn::Value reply);
+
   // The peer's identity (for a client connection: the service's, as of the
   // latest connect).
   AuditToken auditToken() const;
   pid_t pid() const;
   std::string executablePath() const;
+  // All of it: token, executable file, seccomp filter count.
+  PeerIdentity peerIdentity() const;
 
   const std::string& serviceName() const { return serviceName_; }
   bool isServerSide() const { return role_ == Role::Server; }
@@ -143,10 +151,13 @@ class Connection : public std::enable_shared_from_this<Connection> {
 
  private:
   // A server connection on an accepted socket; `lease` goes with the socket.
+  // At most `maxOutstandingRequests` of its requests are delivered and not
+  // yet handled (Message::charge) at any time.
   static std::shared_ptr<Connection> accepted(UniqueFd socket, PeerIdentity identity, std::string serviceName,
-                                              std::shared_ptr<void> lease);
+                                              std::shared_ptr<void> lease, std::size_t maxOutstandingRequests);
 
-  std::shared_ptr<detail::Channel> makeChannel(UniqueFd socket, std::shared_ptr<void> lease);
+  std::shared_ptr<detail::Channel> makeChannel(UniqueFd socket, std::shared_ptr<void> lease,
+                                               std::size_t maxInboundMessages);
   // The socket to send on; a client connection that was interrupted
   // connects again. Null when there is none; then `error` says why.
   std::shared_ptr<detail::Channel> channelForSending(tn::Error& error);

@@ -24,6 +24,13 @@ struct Message {
   // The socket the request came on: a reply must leave on the same one (a
   // client connection that reconnected has a new socket and a new peer).
   std::weak_ptr<detail::Channel> channel;
+  // The request's share of its connection's inbound budget (see
+  // docs/relay.md, "Limits"): given back when the last copy of the message
+  // is gone (or its owner resets this) and the reply sent with it, if any,
+  // has left for the peer. An owner that keeps its requests until it has
+  // answered them thereby limits how many a peer can have unanswered, and a
+  // peer that does not read its replies stops being read itself.
+  std::shared_ptr<const void> charge;
 };
 
 // What a reply handler receives: the reply's body (a dictionary), or a

@@ -9,6 +9,7 @@
 #include <asio/post.hpp>
 #include <asio/posix/stream_descriptor.hpp>
 #include <asio/steady_timer.hpp>
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <chrono>
@@ -19,7 +20,7 @@
 
 #include "platform/log/Log.h"
 #include "platform/relay/ConnectionLimit.h"
-#include "platform/relay/IoThread.h"
+#include "platform/relay/IoContext.h"
 #include "platform/relay/RelayError.h"
 #include "platform/relay/ServicePath.h"
 #include "platform/relay/SocketActivation.h"
@@ -120,7 +121,8 @@ struct Listener::Core : std::enable_shared_from_this<Core> {
   ino_t inode = 0;
   const int fd;  // owned by descriptor
   const std::shared_ptr<detail::ConnectionLimit> limit =
-      std::make_shared<detail::ConnectionLimit>(kDefaultMaxConnectionsPerUser);
+      std::make_shared<detail::ConnectionLimit>(detail::ConnectionLimits{});
+  std::atomic<std::size_t> outstandingRequests{Limits{}.outstandingRequests};
 
   // Set before resume(), then read on `queue`.
   NewConnectionHandler onConnection;
@@ -147,9 +149,15 @@ struct Listener::Core : std::enable_shared_from_this<Core> {
     for (int i = 0; i < kAcceptsPerTurn; ++i) {
       const int accepted = ::accept4(fd, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
       if (accepted >= 0) {
+        UniqueFd socket(accepted);
+        std::shared_ptr<void> lease = leaseFor(socket.get());
+        if (!lease) continue;  // closed here, before it costs anything more
         // Identification reads /proc: it runs on the listener's queue, not here.
-        auto socket = std::make_shared<UniqueFd>(accepted);
-        queue->async([core = shared_from_this(), socket] { core->admit(std::move(*socket)); });
+        auto admitted = std::make_shared<std::pair<UniqueFd, std::shared_ptr<void>>>(std::move(socket),
+                                                                                     std::move(lease));
+        queue->async([core = shared_from_this(), admitted] {
+          core->admit(std::move(admitted->first), std::move(admitted->second));
+        });
         continue;
       }
       if (errno == EINTR || errno == ECONNABORTED) continue;
@@ -164,8 +172,30 @@ struct Listener::Core : std::enable_shared_from_this<Core> {
     armAccept();
   }
 
+  // I/O thread. The connection's place under the limits, or null when it is
+  // refused (or its peer has no credentials).
+  std::shared_ptr<void> leaseFor(int socket) {
+    ucred credentials{};
+    socklen_t size = sizeof credentials;
+    if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) return nullptr;
+    detail::ConnectionLimit::Refusal refusal = detail::ConnectionLimit::Refusal::None;
+    std::shared_ptr<void> lease = limit->acquire(credentials.uid, &refusal);
+    if (!lease && limit->refusalWorthLogging(credentials.uid, std::chrono::steady_clock::now())) {
+      const detail::ConnectionLimits limits = limit->limits();
+      TN_LOG_ERROR(tn::log::traffic(),
+                   "relay service {}: connection from pid {} refused: {} (further refusals for uid {} are "
+                   "not logged for a minute)",
+                   serviceName, credentials.pid,
+                   refusal == detail::ConnectionLimit::Refusal::PerUser
+                       ? fmt::format("uid {} already holds {} connections", credentials.uid, limits.perUser)
+                       : fmt::format("the service holds its limit of {} connections", limits.total),
+                   credentials.uid);
+    }
+    return lease;
+  }
+
   // Listener queue.
-  void admit(UniqueFd socket) {
+  void admit(UniqueFd socket, std::shared_ptr<void> lease) {
     if (cancelled) return;
     tn::Result<PeerIdentity> identity = PeerIdentity::ofSocketPeer(socket.get());
     if (!identity.ok()) {
@@ -173,14 +203,8 @@ struct Listener::Core : std::enable_shared_from_this<Core> {
                   identity.error().description());
       return;
     }
-    std::shared_ptr<void> lease = limit->acquire(identity->auditToken.uid);
-    if (!lease) {
-      TN_LOG_ERROR(tn::log::traffic(), "relay service {}: connection from pid {} refused: uid {} is at its limit",
-                   serviceName, identity->auditToken.pid, identity->auditToken.uid);
-      return;
-    }
-    std::shared_ptr<Connection> connection =
-        makeConnection(std::move(socket), std::move(*identity), serviceName, std::move(lease));
+    std::shared_ptr<Connection> connection = makeConnection(std::move(socket), std::move(*identity), serviceName,
+                                                            std::move(lease), outstandingRequests.load());
     TN_LOG_DEBUG(tn::log::traffic(), "{} accepted", connection->description());
     if (onConnection) onConnection(std::move(connection));
   }
@@ -234,9 +258,11 @@ Listener::Listener(std::shared_ptr<Core> core) : core_(std::move(core)) {}
 Listener::~Listener() { cancel(); }
 
 std::shared_ptr<Connection> Listener::makeConnection(UniqueFd socket, PeerIdentity identity,
-                                                     std::string serviceName, std::shared_ptr<void> lease) {
-  std::shared_ptr<Connection> connection =
-      Connection::accepted(std::move(socket), std::move(identity), std::move(serviceName), std::move(lease));
+                                                     std::string serviceName, std::shared_ptr<void> lease,
+                                                     std::size_t outstandingRequests) {
+  std::shared_ptr<Connection> connection = Connection::accepted(std::move(socket), std::move(identity),
+                                                                std::move(serviceName), std::move(lease),
+                                                                outstandingRequests);
   if (detail::registerForTermination(connection)) connection->deliverTerminationImminent();
   return connection;
 }
@@ -245,7 +271,22 @@ void Listener::setNewConnectionHandler(NewConnectionHandler handler) { core_->on
 
 void Listener::setErrorHandler(ErrorHandler handler) { core_->onError = std::move(handler); }
 
-void Listener::setMaxConnectionsPerUser(std::size_t limit) { core_->limit->setPerUser(limit); }
+void Listener::setMaxConnectionsPerUser(std::size_t limit) {
+  Limits limits = this->limits();
+  limits.connectionsPerUser = limit;
+  setLimits(limits);
+}
+
+void Listener::setLimits(const Limits& limits) {
+  core_->limit->setLimits({limits.connectionsPerUser, limits.connectionsTotal, limits.privilegedReserve});
+  core_->outstandingRequests = std::max<std::size_t>(1, limits.outstandingRequests);
+}
+
+Listener::Limits Listener::limits() const {
+  const detail::ConnectionLimits connections = core_->limit->limits();
+  return Limits{connections.perUser, connections.total, connections.privilegedReserve,
+                core_->outstandingRequests.load()};
+}
 
 void Listener::resume() {
   if (core_->resumed.exchange(true) || core_->cancelled) return;

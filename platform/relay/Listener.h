@@ -17,11 +17,16 @@
 // starting. An activated socket is already listening; there, clients wait
 // in the backlog until resume().
 //
-// Each connection is identified (PeerIdentity) on the listener's queue
-// before the handler sees it; a peer that cannot be identified, or whose
-// user already holds maxConnectionsPerUser() live connections here, is
-// closed without reaching the handler. Failures of the listening socket
-// itself go to the error handler.
+// Limits (Limits below): when a connection is accepted, its peer's uid is
+// read (SO_PEERCRED) and the connection counted against the per-user and
+// total limits before anything else is allocated for it; one over a limit
+// is closed at once, and named in the log at most once a minute per uid.
+// Each admitted connection is then identified (PeerIdentity) on the
+// listener's queue before the handler sees it; a peer that cannot be
+// identified is closed without reaching the handler. Each connection hands
+// out at most `outstandingRequests` requests that are not yet handled
+// (Message::charge); beyond that its socket is not read (back-pressure).
+// Failures of the listening socket itself go to the error handler.
 //
 // Lifetime: the listener accepts while it exists and is resumed; cancel(),
 // or destroying it, stops accepting, closes its socket and removes the
@@ -34,6 +39,7 @@
 
 #include <cstddef>
 #include <functional>
+#include <limits>
 #include <memory>
 #include <string>
 
@@ -49,7 +55,13 @@ class Listener {
   using NewConnectionHandler = std::function<void(std::shared_ptr<Connection>)>;
   using ErrorHandler = std::function<void(const tn::Error&)>;
 
-  static constexpr std::size_t kDefaultMaxConnectionsPerUser = 1024;
+  struct Limits {
+    std::size_t connectionsPerUser = 64;
+    std::size_t connectionsTotal = std::numeric_limits<std::size_t>::max();
+    // Places of the total kept for root and this process's own user.
+    std::size_t privilegedReserve = 0;
+    std::size_t outstandingRequests = 64;  // per connection
+  };
 
   // Binds (or adopts) the socket of `serviceName`; handlers run on `queue`.
   // Errors: InvalidServiceName; SystemError (directory, socket, bind),
@@ -66,6 +78,8 @@ class Listener {
   void setNewConnectionHandler(NewConnectionHandler handler);
   void setErrorHandler(ErrorHandler handler);
   void setMaxConnectionsPerUser(std::size_t limit);
+  void setLimits(const Limits& limits);
+  Limits limits() const;
 
   // Starts listening and accepting. Later calls do nothing.
   void resume();
@@ -87,7 +101,8 @@ class Listener {
   // Makes the server connection for an identified socket (Connection
   // befriends Listener, not its Core).
   static std::shared_ptr<Connection> makeConnection(UniqueFd socket, PeerIdentity identity,
-                                                    std::string serviceName, std::shared_ptr<void> lease);
+                                                    std::string serviceName, std::shared_ptr<void> lease,
+                                                    std::size_t outstandingRequests);
 
   std::shared_ptr<Core> core_;
 };

@@ -4,12 +4,12 @@
 
 namespace relay::detail {
 
-void OutgoingBuffer::append(tn::Bytes frame, std::size_t alreadySent) {
+void OutgoingBuffer::append(tn::Bytes frame, std::size_t alreadySent, std::shared_ptr<const void> whenSent) {
   if (alreadySent >= frame.size()) return;
   size_ += frame.size() - alreadySent;
   if (frames_.empty()) frontOffset_ = alreadySent;
   else if (alreadySent != 0) frame.erase(frame.begin(), frame.begin() + static_cast<std::ptrdiff_t>(alreadySent));
-  frames_.push_back(std::move(frame));
+  frames_.push_back(Frame{std::move(frame), std::move(whenSent)});
 }
 
 std::size_t OutgoingBuffer::gather(std::span<iovec> out) const {
@@ -17,8 +17,8 @@ std::size_t OutgoingBuffer::gather(std::span<iovec> out) const {
   std::size_t offset = frontOffset_;
   for (auto it = frames_.begin(); it != frames_.end() && filled < out.size(); ++it) {
     // iovec takes a mutable pointer; sendmsg only reads through it.
-    out[filled].iov_base = const_cast<uint8_t*>(it->data() + offset);
-    out[filled].iov_len = it->size() - offset;
+    out[filled].iov_base = const_cast<uint8_t*>(it->bytes.data() + offset);
+    out[filled].iov_len = it->bytes.size() - offset;
     ++filled;
     offset = 0;
   }
@@ -28,7 +28,7 @@ std::size_t OutgoingBuffer::gather(std::span<iovec> out) const {
 void OutgoingBuffer::consume(std::size_t count) {
   size_ -= count;
   while (count > 0) {
-    const std::size_t remaining = frames_.front().size() - frontOffset_;
+    const std::size_t remaining = frames_.front().bytes.size() - frontOffset_;
     if (count < remaining) {
       frontOffset_ += count;
       return;

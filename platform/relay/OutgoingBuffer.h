@@ -2,8 +2,11 @@
 //
 // Whole frames are appended and leave from the front, so frames never
 // interleave on the wire. Frames are kept as they were encoded (no copy
-// into a ring) and handed to sendmsg() as an iovec list. Internal to
-// platform/relay; not synchronized (the channel guards it with its mutex).
+// into a ring) and handed to sendmsg() as an iovec list. A frame may carry
+// a token that is released once the kernel has taken its last byte (or the
+// buffer is cleared): a reply's request keeps its share of the inbound
+// budget until the reply has really left. Internal to platform/relay; not
+// synchronized (the channel guards it with its mutex).
 
 #pragma once
 
@@ -11,6 +14,7 @@
 
 #include <cstddef>
 #include <deque>
+#include <memory>
 #include <span>
 
 #include "platform/value/Value.h"
@@ -19,8 +23,9 @@ namespace relay::detail {
 
 class OutgoingBuffer {
  public:
-  // Queues `frame`, of which the first `alreadySent` bytes went out already.
-  void append(tn::Bytes frame, std::size_t alreadySent = 0);
+  // Queues `frame`, of which the first `alreadySent` bytes went out already;
+  // `whenSent` is released once the rest has.
+  void append(tn::Bytes frame, std::size_t alreadySent = 0, std::shared_ptr<const void> whenSent = nullptr);
 
   bool empty() const { return size_ == 0; }
   // Bytes still to send.
@@ -37,7 +42,11 @@ class OutgoingBuffer {
   void clear();
 
  private:
-  std::deque<tn::Bytes> frames_;
+  struct Frame {
+    tn::Bytes bytes;
+    std::shared_ptr<const void> whenSent;
+  };
+  std::deque<Frame> frames_;
   std::size_t frontOffset_ = 0;  // bytes of frames_.front() already sent
   std::size_t size_ = 0;
 };

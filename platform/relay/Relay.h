@@ -30,7 +30,7 @@
 //   RelayError.h        error domain "relay"
 //
 // Internal: Channel (one socket), OutgoingBuffer, PendingReplies,
-// InboundBudget, ConnectionLimit, IoThread, ProcessStartTime, UniqueFd.
+// InboundBudget, ConnectionLimit, IoContext, ProcessStartTime, UniqueFd.
 //
 // Including this header includes the public headers above.
 

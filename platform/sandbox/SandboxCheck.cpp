@@ -108,6 +108,12 @@ std::optional<uint64_t> processStartTime(pid_t pid) {
   return parseStartTime(*stat);
 }
 
+bool countsAsSandboxed(std::optional<uint64_t> peerFilters) {
+  if (!peerFilters) return true;
+  const std::optional<uint64_t> ours = seccompFilterCountOf("self");
+  return !ours || *peerFilters > *ours;
+}
+
 bool isProcessSandboxed(pid_t pid) {
   if (pid <= 0) return false;
   const std::optional<uint64_t> theirs = seccompFilterCount(pid);

@@ -13,6 +13,17 @@
 // inherits the container's filters. On kernels older than 5.9, whose status
 // has no Seccomp_filters line, a process in filter mode ("Seccomp: 2")
 // counts as running under one filter.
+//
+// Two ways to ask:
+//   - For a connected peer, the daemon reads the peer's count once, when the
+//     connection is accepted (the relay's PeerIdentity), and asks
+//     countsAsSandboxed(). That answer fails closed: a count that could not
+//     be read, or an own count that cannot be read, means "sandboxed", the
+//     safer answer, since a sandboxed peer gets less.
+//   - isProcessSandboxed() looks at a pid now. It answers "not sandboxed"
+//     for a process that is gone or unreadable, which is right for callers
+//     that only want to know whether a live process they know of runs
+//     confined; it is not for judging a connection.
 
 #include <sys/types.h>
 
@@ -21,6 +32,12 @@
 #include <string_view>
 
 namespace sandbox {
+
+// The answer for a peer whose filter count was read as peerFilters (none:
+// it could not be read): true when peerFilters is none, when our own count
+// cannot be read, or when peerFilters exceeds our own count (read now, so a
+// filter the daemon added since is taken into account).
+bool countsAsSandboxed(std::optional<uint64_t> peerFilters);
 
 // True when the process pid is sandboxed (see above). False when it does not
 // exist (any more) or its status cannot be read.

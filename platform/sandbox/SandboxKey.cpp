@@ -13,6 +13,8 @@
 #include <fmt/format.h>
 #include <openssl/rand.h>
 
+#include "platform/value/AtomicFile.h"
+
 namespace sandbox {
 namespace {
 
@@ -82,41 +84,19 @@ tn::Result<void> makeDirectories(const std::string& directory) {
   }
 }
 
-bool writeAll(int fd, const uint8_t* bytes, size_t size) {
-  while (size > 0) {
-    const ssize_t n = ::write(fd, bytes, size);
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return false;
-    bytes += n;
-    size -= static_cast<size_t>(n);
-  }
-  return true;
-}
-
-// Writes a new random key into a temporary file beside path and links it to
-// path. Answers EEXIST when another process linked its key first.
+// Writes a new random key to path, unless a key is there already (then
+// EEXIST): of two processes creating it at once exactly one wins. The
+// temporary file is the atomic writer's, so a creator killed half-way leaves
+// nothing that the next one does not clean up.
 tn::Result<void> createKeyFile(const std::string& path) {
   const std::string directory = path.substr(0, path.rfind('/'));
   if (tn::Result<void> made = makeDirectories(directory); !made) return made;
+  (void)tn::removeStaleTemporaryFiles(directory);
   SandboxKey key{};
   if (RAND_bytes(key.data(), static_cast<int>(key.size())) != 1) return keyError(path, "no randomness", EIO);
-
-  std::string temporary = path + ".tmp-XXXXXX";
-  const int fd = ::mkostemp(temporary.data(), O_CLOEXEC);  // mode 0600
-  if (fd < 0) return keyError(path, "cannot create", errno);
-  int error = 0;
-  if (::fchmod(fd, 0600) != 0 || !writeAll(fd, key.data(), key.size()) || ::fsync(fd) != 0) error = errno;
-  if (::close(fd) != 0 && error == 0) error = errno;
-  // link() never replaces an existing name, unlike rename(): of two
-  // processes creating the key at once exactly one wins.
-  if (error == 0 && ::link(temporary.c_str(), path.c_str()) != 0) error = errno;
-  ::unlink(temporary.c_str());
-  if (error != 0) return keyError(path, "cannot create", error);
-  const int directoryFd = ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-  if (directoryFd >= 0) {
-    ::fsync(directoryFd);
-    ::close(directoryFd);
-  }
+  tn::Result<void> created = tn::createFileAtomically(
+      path, std::string_view(reinterpret_cast<const char*>(key.data()), key.size()), 0600);
+  if (!created) return keyError(path, "cannot create", static_cast<int>(created.error().code()));
   return {};
 }
 

@@ -3,6 +3,7 @@
 #include <charconv>
 #include <chrono>
 #include <cmath>
+#include <cstdlib>
 #include <cstdint>
 
 #include <fmt/format.h>
@@ -50,6 +51,22 @@ bool readDigits(std::string_view& s, size_t count, int64_t& out) {
   return true;
 }
 
+bool isLeapYear(int64_t year) { return year % 4 == 0 && (year % 100 != 0 || year % 400 == 0); }
+
+int64_t daysInMonth(int64_t year, int64_t month) {
+  static constexpr int64_t kDays[] = {31, 28, 31, 30, 31, 30, 31, 31, 30, 31, 30, 31};
+  return month == 2 && isLeapYear(year) ? 29 : kDays[month - 1];
+}
+
+// Only times the writer can produce are read, so that reading and writing
+// back never changes a date: months 1-12, days that exist in that month of
+// that year, hours 0-23 (no 24:00:00), minutes and seconds 0-59 (dates count
+// seconds without leap seconds, so 23:59:60 would read as the next day).
+bool isRealTime(int64_t year, int64_t month, int64_t day, int64_t hour, int64_t minute, int64_t second) {
+  if (month < 1 || month > 12 || day < 1 || day > daysInMonth(year, month)) return false;
+  return hour <= 23 && minute <= 59 && second <= 59;
+}
+
 bool expect(std::string_view& s, char c) {
   if (s.empty() || s.front() != c) return false;
   s.remove_prefix(1);
@@ -69,7 +86,22 @@ bool operator==(const Date& a, const Date& b) {
 }
 
 bool hasISO8601Form(Date date) {
-  return std::isfinite(date.secondsSince1970) && std::fabs(date.secondsSince1970) <= 1e16;
+  const double t = date.secondsSince1970;
+  if (!std::isfinite(t) || std::fabs(t) > 1e16) return false;
+  // The text is whole seconds plus a fraction, read back as their sum. A
+  // tiny negative t has none that adds up to it: its fraction t - floor(t)
+  // rounds to 1.
+  const double whole = std::floor(t);
+  const double fraction = t - whole;
+  return fraction < 1.0 && whole + fraction == t;
+}
+
+std::optional<int64_t> wholeSecondsSince1970(Date date) {
+  const double whole = std::floor(date.secondsSince1970);
+  // -2^63 is exact as a double; 2^63 is the first value past the range.
+  constexpr double kLimit = 9223372036854775808.0;
+  if (!std::isfinite(whole) || whole < -kLimit || whole >= kLimit) return std::nullopt;
+  return static_cast<int64_t>(whole);
 }
 
 std::string formatISO8601(Date date) {
@@ -91,8 +123,11 @@ std::string formatISO8601(Date date) {
   std::string out = fmt::format("{}-{:02}-{:02}T{:02}:{:02}:{:02}", year, c.month, c.day,
                                 rem / 3600, rem / 60 % 60, rem % 60);
   if (fraction != 0) {
-    char buf[64];
+    // The shortest fixed form of a fraction takes up to "0." + 323 zeros +
+    // 17 digits (a subnormal one).
+    char buf[400];
     auto r = std::to_chars(buf, buf + sizeof buf, fraction, std::chars_format::fixed);
+    if (r.ec != std::errc()) std::abort();  // cannot happen with this buffer
     std::string_view digits(buf, static_cast<size_t>(r.ptr - buf));  // "0.25"
     out.append(digits.substr(1));
   }
@@ -118,8 +153,7 @@ std::optional<Date> parseISO8601(std::string_view s) {
       !expect(s, 'T') || !readDigits(s, 2, hour) || !expect(s, ':') || !readDigits(s, 2, minute) ||
       !expect(s, ':') || !readDigits(s, 2, second))
     return std::nullopt;
-  if (month < 1 || month > 12 || day < 1 || day > 31 || hour > 23 || minute > 59 || second > 60)
-    return std::nullopt;
+  if (!isRealTime(year, month, day, hour, minute, second)) return std::nullopt;
   double fraction = 0;
   if (!s.empty() && s.front() == '.') {
     size_t end = 1;

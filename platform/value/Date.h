@@ -4,6 +4,7 @@
 // so sub-second precision survives every encoding), and its ISO 8601 text.
 
 #include <compare>
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -30,8 +31,17 @@ std::string formatISO8601(Date date);
 // that have a text form.
 bool hasISO8601Form(Date date);
 
+// The whole seconds since 1970 (rounded toward negative infinity), or none
+// when the date is not finite or out of the range of int64_t. Converting a
+// double outside that range to an integer is undefined, so every conversion
+// of a stored or received date goes through this.
+std::optional<int64_t> wholeSecondsSince1970(Date date);
+
 // Parses what formatISO8601 writes: YYYY-MM-DDTHH:MM:SS[.fraction]Z, UTC only,
-// plus the signed-year form. Returns none for anything else.
+// plus the signed-year form. Returns none for anything else, and for times
+// that do not exist: month 13, 2023-02-31, February 29 of a year that is not
+// a leap year, hour 24 (even 24:00:00), minute 60, second 60 (no leap
+// seconds). Every date read is written back as the same text.
 std::optional<Date> parseISO8601(std::string_view text);
 
 }  // namespace tn

@@ -32,6 +32,9 @@ URL URL::fileURLWithPath(std::string_view path) {
 }
 
 std::optional<URL> URL::parse(std::string_view text) {
+  // A NUL, raw or escaped, names nothing: file-system calls would see only
+  // the text before it.
+  if (text.find('\0') != std::string_view::npos) return std::nullopt;
   const size_t colon = text.find(':');
   if (colon == std::string_view::npos || colon == 0) return std::nullopt;
   for (size_t i = 0; i < colon; ++i)

@@ -20,7 +20,7 @@ class URL {
 
   // Parses "scheme://host/path" (host may be empty) with percent-decoding of
   // the path. Returns none for a string without "scheme:", with a bad escape
-  // ("%G1", a truncated "%4"), or with an escaped NUL.
+  // ("%G1", a truncated "%4"), or with a NUL, escaped ("%00") or raw.
   static std::optional<URL> parse(std::string_view text);
 
   const std::string& scheme() const { return scheme_; }

@@ -2,8 +2,10 @@
 
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
+#include <filesystem>
 #include <utility>
 
 #include "platform/log/Log.h"
@@ -35,6 +37,44 @@ int64_t versionOf(const tn::Value& document) {
   return 0;
 }
 
+// Removes what saves interrupted by a crash or a kill left beside the file
+// (writers still alive keep theirs; see removeStaleTemporaryFiles).
+void removeStaleTemporariesBeside(const std::string& path) {
+  const std::string directory = std::filesystem::path(path).parent_path().string();
+  const tn::Result<size_t> removed = tn::removeStaleTemporaryFiles(directory.empty() ? "." : directory);
+  if (!removed) {
+    if (removed.error().code() != ENOENT)
+      TN_LOG_ERROR(tn::log::ops(), "cannot clean up temporary files: {}", removed.error().localizedDescription());
+    return;
+  }
+  if (*removed != 0) TN_LOG_DEFAULT(tn::log::ops(), "removed {} stale temporary files in {}", *removed, directory);
+}
+
+// Containers nested inside `value`, counting itself: 0 for a scalar.
+int depthOf(const tn::Value& value) {
+  int deepest = 0;
+  if (const tn::Array* array = value.array()) {
+    for (const tn::Value& element : *array) deepest = std::max(deepest, depthOf(element));
+    return deepest + 1;
+  }
+  if (const tn::Dictionary* dictionary = value.dictionary()) {
+    for (const auto& [key, element] : *dictionary) deepest = std::max(deepest, depthOf(element));
+    return deepest + 1;
+  }
+  return 0;
+}
+
+// The entry's text in the file, unless it nests deeper than `depth` or the
+// writer cannot write it.
+tn::Result<std::string> checkedItem(const std::string& key, const tn::Value& entry, int depth) {
+  if (depthOf(entry) > depth) return tn::TNMakeErrorWithFormat(4, "nested deeper than {} levels", depth);
+  return annotationfile::itemFor(key, entry);
+}
+
+std::optional<tn::Error> refused(const std::string& key, const std::string& reason) {
+  return tn::TNMakeErrorWithFormat(4, "annotation for {} refused: {}", key, reason);
+}
+
 }  // namespace
 
 std::string TNDAnnotationStore::defaultDatabasePath() {
@@ -44,6 +84,7 @@ std::string TNDAnnotationStore::defaultDatabasePath() {
 
 TNDAnnotationStore::TNDAnnotationStore(const std::optional<std::string>& path)
     : annotationsPath_(path ? *path : defaultDatabasePath()) {
+  removeStaleTemporariesBeside(annotationsPath_);
   const tn::Result<void> loaded = loadDb(annotationsPath_);
   if (loaded.ok()) return;
   if (!isMissingFile(loaded.error())) {
@@ -61,17 +102,60 @@ std::optional<tn::Dictionary> TNDAnnotationStore::annotationForIdentifier(const 
   return *entry->dictionary();
 }
 
-void TNDAnnotationStore::setAnnotation(const std::optional<tn::Dictionary>& annotation, const std::string& key) {
+std::optional<tn::Error> TNDAnnotationStore::setAnnotation(const std::optional<tn::Dictionary>& annotation,
+                                                           const std::string& key, Save save) {
+  const auto existing = items_.find(key);
+  const size_t oldSize = existing == items_.end() ? 0 : existing->second.size();
   if (!annotation) {
     annotations_.erase(key);
+    storedSize_ -= oldSize;
+    items_.erase(key);
   } else {
     tn::Dictionary entry = annotationForIdentifier(key).value_or(tn::Dictionary());
     for (const auto& [name, value] : *annotation) entry.set(name, value);
-    annotations_.set(key, tn::Value(std::move(entry)));
+    const tn::Value value(std::move(entry));
+    tn::Result<std::string> item = checkedItem(key, value, kMaxEntryDepth);
+    if (!item) return refused(key, item.error().localizedDescription());
+    const size_t newSize = item->size();
+    if (newSize > kMaxEntrySize) return refused(key, fmt::format("{} bytes, more than {}", newSize, kMaxEntrySize));
+    // An entry may always shrink, even in a store that is over its bound.
+    if (newSize > oldSize && storedSize_ - oldSize + newSize > kMaxStoreSize) {
+      return refused(key, fmt::format("the annotations would take more than {} bytes", kMaxStoreSize));
+    }
+    annotations_.set(key, value);
+    items_[key] = std::move(*item);
+    storedSize_ = storedSize_ - oldSize + newSize;
   }
+  unsaved_ = true;
+  if (save == Save::Now) this->save();
+  return std::nullopt;
+}
+
+void TNDAnnotationStore::saveIfNeeded() {
+  if (unsaved_) save();
+}
+
+void TNDAnnotationStore::save() {
   if (const tn::Result<void> saved = saveDb(); !saved.ok()) {
     TN_LOG_ERROR(tn::log::ops(), "unable to save annotations:{} error:{}", annotationsPath_,
                  saved.error().description());
+  }
+}
+
+tn::Result<size_t> TNDAnnotationStore::encodedEntrySize(const tn::Dictionary& entry) {
+  const tn::Result<std::string> item = checkedItem("", tn::Value(entry), kMaxEntryDepth);
+  if (!item) return item.error();
+  return item->size();
+}
+
+void TNDAnnotationStore::makeItems() {
+  items_.clear();
+  storedSize_ = 0;
+  for (const auto& [key, value] : annotations_) {
+    tn::Result<std::string> item = annotationfile::itemFor(key, value);
+    if (!item) continue;  // saves then write the whole map with the writer
+    storedSize_ += item->size();
+    items_.emplace(key, std::move(*item));
   }
 }
 
@@ -89,14 +173,20 @@ tn::Result<void> TNDAnnotationStore::loadDb(const std::string& path) {
   }
   const tn::Value& data = (*document)["data"];
   annotations_ = data.isDictionary() ? *data.dictionary() : tn::Dictionary();
+  makeItems();
   return {};
 }
 
-tn::Result<void> TNDAnnotationStore::saveDb() const {
-  const tn::Value document(tn::Dictionary{{"version", tn::Value(kDatabaseVersion)}, {"data", tn::Value(annotations_)}});
-  tn::Result<std::string> text = tn::writeXmlDocument(document);
+tn::Result<std::string> TNDAnnotationStore::fileText() const {
+  return annotationfile::document(kDatabaseVersion, annotations_, items_);
+}
+
+tn::Result<void> TNDAnnotationStore::saveDb() {
+  tn::Result<std::string> text = fileText();
   if (!text.ok()) return text.error();
-  return tn::writeFileAtomically(annotationsPath_, *text);
+  tn::Result<void> written = tn::writeFileAtomically(annotationsPath_, *text);
+  if (written.ok()) unsaved_ = false;
+  return written;
 }
 
 }  // namespace tnd

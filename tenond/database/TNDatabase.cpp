@@ -6,6 +6,7 @@
 #include "libtenon/model/SmallDictionaryChanges.h"
 #include "platform/log/Log.h"
 #include "platform/notify/Post.h"
+#include "tenond/QueueRanks.h"
 
 namespace tnd {
 
@@ -67,6 +68,7 @@ bool TNDatabase::initWithDatabase(const std::optional<std::string>& path,
   workspace_ = *opened;
   lookup_ = std::make_unique<tn::RegistrarLookup>(workspace_);
   sync_ = tn::dispatch::SerialQueue::create("TNDatabase");
+  sync_->setLockRank(kLeafQueueRank);
   observer_ = std::make_shared<RegistrarObserver>(*this);
   workspace_->addObserver(observer_);
   if (localeQueue) {
@@ -198,9 +200,14 @@ std::optional<tn::Dictionary> TNDatabase::annotationForPlugIn(const TNDPlugIn& p
   return sync_->sync([&] { return annotations_->annotationForIdentifier(key); });
 }
 
-void TNDatabase::setAnnotation(const std::optional<tn::Dictionary>& annotation, const TNDPlugIn& plugIn) {
+std::optional<tn::Error> TNDatabase::setAnnotation(const std::optional<tn::Dictionary>& annotation,
+                                                   const TNDPlugIn& plugIn, AnnotationSave save) {
   const std::string key = plugIn.annotationKey();
-  sync_->sync([&] { annotations_->setAnnotation(annotation, key); });
+  return sync_->sync([&] { return annotations_->setAnnotation(annotation, key, save); });
+}
+
+void TNDatabase::saveAnnotations() {
+  sync_->sync([&] { annotations_->saveIfNeeded(); });
 }
 
 void TNDatabase::notifyAnnotationChange() {
@@ -215,9 +222,12 @@ void TNDatabase::autoElect(const TNDPlugIn& plugIn) {
   const std::string key = plugIn.annotationKey();
   const tn::Dictionary annotation = annotations_->annotationForIdentifier(key).value_or(tn::Dictionary());
   if (const tn::Value* election = annotation.find("election")) {
-    if (auto number = election->numberAsDouble(); number && static_cast<int64_t>(*number) != 0) return;
+    // Compared by value, never through a converted integer: 0.5 is not 0,
+    // and a huge or NaN number must not be converted at all.
+    if (election->isNumber() && *election != tn::Value(0)) return;
   }
-  annotations_->setAnnotation(tn::dictionaryChanging(annotation, "election", tn::Value(1)), key);
+  // An entry within bounds stays within them with one number changed.
+  (void)annotations_->setAnnotation(tn::dictionaryChanging(annotation, "election", tn::Value(1)), key);
 }
 
 // --- Install events ----------------------------------------------------------

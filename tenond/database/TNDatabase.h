@@ -72,6 +72,15 @@ class TNDatabase {
   // order; none when it has no plug-ins (or is unknown).
   std::optional<std::vector<std::shared_ptr<TNDPlugIn>>> plugInsWithinApplication(const tn::URL& url);
 
+  // The discovery query (RegistryQuery.cpp): the installed plug-ins that
+  // may satisfy `rules` (a dictionary or null: every plug-in), narrowed by
+  // the registrar and by the election filter of the rules'
+  // "XTUserElection" entry (ElectionFilter.h), as cached plug-ins, each
+  // once, in the registrar's order. Records of placeholder applications are
+  // skipped. None when the registrar answered none (rules of another kind).
+  // On the service queue; never on the database queue.
+  std::optional<std::vector<std::shared_ptr<TNDPlugIn>>> findPlugIns(const tn::Value& rules);
+
   // --- Registration (the registrar's) ---
 
   // None on success; else Tenon error 2 "Registrar failed to register the
@@ -83,10 +92,20 @@ class TNDatabase {
 
   // --- Annotations ---
 
+  using AnnotationSave = TNDAnnotationStore::Save;
+
   std::optional<tn::Dictionary> annotationForPlugIn(const TNDPlugIn& plugIn);
   // Merges (or with none removes) the plug-in's annotation and saves the
-  // file. Never fails the caller; does not post the change notification.
-  void setAnnotation(const std::optional<tn::Dictionary>& annotation, const TNDPlugIn& plugIn);
+  // file, or with AnnotationSave::Deferred leaves the save to
+  // saveAnnotations(). A failed save is logged, never reported. The one
+  // error: an annotation beyond the store's bounds, refused with nothing
+  // changed (TNDAnnotationStore::setAnnotation). Does not post the change
+  // notification.
+  std::optional<tn::Error> setAnnotation(const std::optional<tn::Dictionary>& annotation, const TNDPlugIn& plugIn,
+                                         AnnotationSave save = AnnotationSave::Now);
+  // Writes the annotation file when a change has not reached it yet: a
+  // request that deferred its saves calls this before it answers.
+  void saveAnnotations();
   // Posts "com.ostrel.tenon.annotation-change".
   void notifyAnnotationChange();
   // On the database queue: elects a plug-in that carries the auto-elect
@@ -131,6 +150,8 @@ class TNDatabase {
   void purgeCachesToLimit(uint32_t limit);
   std::shared_ptr<TNDPlugIn> cachedPlugIn(const tn::UUID& uuid);
   void localeChanged(const std::string& locale);
+  // The registrar's answer to the discovery query (RegistryQuery.cpp).
+  std::optional<registrar::PlugInList> queryRegistrar(const tn::Value& rules);
 
   std::shared_ptr<registrar::Registrar> workspace_;
   std::unique_ptr<tn::RegistrarLookup> lookup_;

@@ -1,10 +1,12 @@
 #include "tenond/plugin/TNDPlugIn.h"
 
+#include <cerrno>
 #include <cstdlib>
 #include <cstring>
 #include <utility>
 
 #include "libtenon/model/TNSandboxExtension.h"
+#include "platform/value/Date.h"
 #include "platform/log/Log.h"
 
 namespace tnd {
@@ -23,12 +25,6 @@ tn::Error misconfigured(std::string message) { return tn::TNMakeError(tn::kUnusa
 std::string failureText(const tn::Error& error) {
   const char* text = strerrordesc_np(static_cast<int>(error.code()));
   return text ? text : error.localizedDescription();
-}
-
-tn::URL appendingPathComponent(const tn::URL& directory, const std::string& component) {
-  std::string path = directory.path();
-  if (!path.ends_with('/')) path += '/';
-  return tn::URL::fileURLWithPath(path + component);
 }
 
 }  // namespace
@@ -51,7 +47,8 @@ std::shared_ptr<TNDPlugIn> TNDPlugIn::initWithRGData(const registrar::PlugInPtr&
     return nullptr;
   }
   plugIn->setPlugInDictionary(record->plugInDictionary());
-  plugIn->setLastModified(static_cast<int64_t>(record->registrationDate().secondsSince1970));
+  // The store's date is a double read from a file: never converted unchecked.
+  plugIn->setLastModified(tn::wholeSecondsSince1970(record->registrationDate()).value_or(0));
   plugIn->setOnSystemVolume(record->onSystemPartition());
   plugIn->copyRegistrarFacts(*record, lookup);
 
@@ -154,10 +151,14 @@ tn::Dictionary TNDPlugIn::issueResourceExtensions(const tn::Value& resources) co
   for (const tn::Value& element : list) {
     const std::string* resource = element.string();
     if (resource == nullptr) continue;
-    const tn::URL location = *resource == "." ? *bundle : appendingPathComponent(*bundle, *resource);
-    tn::Result<std::string> token = tn::issueFileExtension(location);
+    tn::Result<std::string> token = tn::issueBundleResourceExtension(*bundle, *resource);
+    if (!token.ok() && token.error().code() == EPERM) {
+      TN_LOG_INFO(tn::log::ops(), "refusing extension for resource {} of plug-in at {}: {}", *resource,
+                  bundle->path(), token.error().localizedDescription());
+      continue;
+    }
     if (!token.ok()) {
-      TN_LOG_INFO(tn::log::ops(), "failed to make extension for {} in plug-in at {}: {}", location.path(),
+      TN_LOG_INFO(tn::log::ops(), "failed to make extension for {} in plug-in at {}: {}", *resource,
                   bundle->path(), failureText(token.error()));
       continue;
     }

@@ -16,6 +16,7 @@
 
 #include <memory>
 #include <mutex>
+#include <set>
 #include <optional>
 #include <string>
 
@@ -23,6 +24,8 @@
 #include "libtenon/model/TNPlugInCore.h"
 #include "libtenon/model/TNRegistryLookup.h"
 #include "platform/registrar/Registrar.h"
+#include "tenond/plugin/TNDHost.h"
+#include "tenond/plugin/TNDMatchContext.h"
 
 namespace tnd {
 
@@ -84,8 +87,75 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   // extension for the bundle identifier, unless a data plug-in) to a form.
   void augmentForm(tn::Dictionary& form) const;
   // Resource (relative path, "." for the bundle) to its file extension
-  // token; resources whose extension fails are logged and left out.
+  // token; resources whose extension fails are logged and left out. A
+  // resource that is absolute, has a ".." component or resolves outside the
+  // bundle (links followed) gets no token: it is logged at info level on
+  // "ops" as "refusing extension for resource <name> of plug-in at <path>".
   tn::Dictionary issueResourceExtensions(const tn::Value& resources) const;
+
+  // --- Matching rules (TNDPlugInMatching.cpp) ---
+  //
+  // A rules dictionary maps attribute keys to patterns; a plug-in matches
+  // when it matches every entry, tried in the dictionary's order up to the
+  // first that fails. Null and empty rules match every plug-in; rules of
+  // another kind match none. Keys: "ENTITLEMENT:<name>" (an entitlement,
+  // never falling back), "XTExtensionIdentifier", "com.ostrel.uuid",
+  // "XTUserElection" (the election as a decimal string),
+  // "XTExtensionContainingApp" (the containing application's path; no
+  // application fails whatever the pattern), and any other key: the
+  // attribute, else the information dictionary's own value. Patterns: true
+  // and false (present / absent, numbers 1 and 0 alike), a dictionary (an
+  // activation rule's offer), a string (one comparison), an array (any of
+  // its strings). Evaluation only reads; its only side effects are log
+  // lines. Bounded: rules of more than kMaxRuleEntries entries and arrays
+  // (values or patterns) of more than kMaxMatchAlternatives elements match
+  // nothing, and one call does at most kMaxMatchWork units of work (a unit
+  // is about one byte compared); a call that would do more answers no.
+  // Not on the database queue (the election reads the annotation store).
+
+  static constexpr size_t kMaxRuleEntries = 64;
+  static constexpr size_t kMaxMatchAlternatives = 256;
+  static constexpr size_t kMaxMatchWork = 65536;
+
+  // match(rules, TNDMatchContext::current()).
+  bool match(const tn::Value& rules) const;
+  bool match(const tn::Value& rules, const TNDMatchContext& context) const;
+  // One entry of a rules dictionary.
+  bool matchKey(std::string_view key, const tn::Value& pattern, const TNDMatchContext& context) const;
+  // The plug-in's activation rule (value) against a host's offer (pattern),
+  // logged at debug level on "extension".
+  static bool matchDictionary(const tn::Value& value, const tn::Value& pattern, const TNDMatchContext& context);
+  // A string value against a string pattern or an array of them (any).
+  static bool matchValue(std::string_view value, const tn::Value& patterns, const TNDMatchContext& context);
+  // One comparison: the pattern's leading operator ("?TY-CONFORMS:",
+  // "?TY-IS:", "<>", "<=", ">=", "=", "<", ">", or none: equality) and the
+  // numeric string comparison of version strings.
+  static bool matchValue(std::string_view value, std::string_view pattern, const TNDMatchContext& context);
+  // The value "XTUserElection" compares: the annotation's election as a
+  // signed 64-bit integer with bits 8 to 15 cleared, in decimal; "0"
+  // without an annotation or an election.
+  std::string electionValue(const TNDMatchContext& context) const;
+
+  // --- Host authorization (HostAuthorization.cpp) ---
+
+  // The host entitlement whose value (rules) restricts the plug-ins a host
+  // may use, and the plug-in key naming an entitlement every host needs.
+  static constexpr const char* kHostRestrictionEntitlement = "com.ostrel.developer.tenon.allowedplugins";
+  static constexpr std::string_view kHostEntitlementKey = "XTExtensionHostEntitlement";
+
+  // None when `host` may use this plug-in; else the reason: "invalid host
+  // restriction entitlement" (the host's restriction is not a dictionary),
+  // "the host's plug-in entitlement does not allow this plug-in" (the
+  // plug-in does not match it), or "the host does not have the \"E\"
+  // entitlement" (the plug-in demands E of its hosts). In that order.
+  std::optional<std::string> allowForClient(const TNDHost& host, const TNDMatchContext& context) const;
+  std::optional<std::string> allowForClient(const TNDHost& host) const {
+    return allowForClient(host, TNDMatchContext::current());
+  }
+  // The privacy services the user granted to the plug-in's containing
+  // application (the consent store, platform/privy); empty for a plug-in
+  // outside any application.
+  std::set<std::string> allowedPrivyServices() const;
 
   // A copy of `dictionary` without the keys that begin with "DT".
   static tn::Dictionary prunedInfoDictionaryFor(const tn::Dictionary& dictionary);

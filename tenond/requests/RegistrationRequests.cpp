@@ -2,6 +2,7 @@
 // Each walks its paths in order and stops at the first failure; what was
 // done for earlier paths stays done.
 
+#include "platform/log/Escape.h"
 #include "platform/log/Log.h"
 #include "platform/value/MessageValue.h"
 #include "platform/value/URL.h"
@@ -10,16 +11,11 @@
 #include "tenond/server/TNDServer.h"
 
 namespace tnd {
-namespace {
-
-constexpr const char* kManagerEntitlement = "com.ostrel.private.tenon.manager";
-
-}  // namespace
 
 void Transaction::addPlugIns() {
   processPaths([this](const std::string& path, bool resolved) {
     if (!resolved) {
-      fail(kErrorBadPath, fmt::format("invalid plugin path: {}", path));
+      fail(kErrorBadPath, fmt::format("invalid plugin path: {}", tn::log::escapeText(path)));
       return false;
     }
     TN_PROBE_PLUGIN_ADD(path.c_str());
@@ -35,15 +31,19 @@ void Transaction::addPlugIns() {
 void Transaction::removePlugIns() {
   processPaths([this](const std::string& path, bool resolved) {
     TN_PROBE_PLUGIN_REMOVE(path.c_str(), resolved);
-    if (!client_->hasEntitlement(kManagerEntitlement)) {
+    // The program must hold the manager entitlement and its user be
+    // privileged; both refusals look alike to the peer.
+    if (!client_->mayManage()) {
       TN_LOG_DEFAULT(tn::log::defaultLog(),
                      "refused request from pid={} to remove plug-in at {} - client lacks required entitlement",
                      client_->pid(), path);
       fail(kErrorNotPermitted, std::string("caller lacks entitlement for this operation"));
       return false;
     }
-    if (server()->removePlugIn(tn::URL::fileURLWithPath(path))) {
-      fail(kErrorBadPath, fmt::format("no plugin at {}", path));
+    // A path with a NUL names nothing; the registrar never sees it.
+    const bool namesNothing = !resolved && path.find('\0') != std::string::npos;
+    if (namesNothing || server()->removePlugIn(tn::URL::fileURLWithPath(path))) {
+      fail(kErrorBadPath, fmt::format("no plugin at {}", tn::log::escapeText(path)));
       return false;
     }
     return true;

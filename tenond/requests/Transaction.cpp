@@ -4,7 +4,10 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "platform/log/Escape.h"
 #include "platform/log/Log.h"
+#include "platform/log/LogContext.h"
+#include "platform/relay/RelayError.h"
 #include "platform/value/MessageValue.h"
 #include "tenond/server/TNDRelayClient.h"
 #include "tenond/server/TNDServer.h"
@@ -16,10 +19,13 @@ namespace tnd {
 // request" until they do.
 const Transaction::Route Transaction::kRoutes[] = {
     {"add", &Transaction::addPlugIns},     {"remove", &Transaction::removePlugIns},
-    {"bulk", &Transaction::bulkPlugIns},   {"match", &Transaction::unrecognized},
+    {"bulk", &Transaction::bulkPlugIns},   {"match", &Transaction::matchPlugIns},
     {"ready", &Transaction::unrecognized}, {"access", &Transaction::unrecognized},
-    {"annotate", &Transaction::unrecognized}, {"bulk-annotate", &Transaction::unrecognized},
+    {"annotate", &Transaction::annotatePlugIns}, {"bulk-annotate", &Transaction::bulkAnnotatePlugIns},
     {"lock", &Transaction::unrecognized},  {"find", &Transaction::findPlugIn},
+    // Tenon's own, beyond the ten request types: why a plug-in is or is not
+    // offered to a host.
+    {"explain", &Transaction::explainPlugIn},
 };
 
 Transaction::Transaction(relay::Message request, std::shared_ptr<TNDRelayClient> client)
@@ -29,6 +35,8 @@ std::shared_ptr<TNDServer> Transaction::server() const { return client_->server(
 std::shared_ptr<relay::Connection> Transaction::connection() const { return client_->connection(); }
 
 void Transaction::dispatch() {
+  // Lines logged for this request are rate-limited per client (docs/logging.md).
+  const tn::log::ContextScope logContext(static_cast<tn::log::ContextId>(client_->pid()));
   const std::string* type = relay_dictionary_get_string(request(), "request");
   version_ = relay_dictionary_get_uint64(request(), "version").value_or(0);
 
@@ -63,9 +71,27 @@ void Transaction::route(const std::string* type) {
 void Transaction::unrecognized() { fail(kErrorInvalidRequest, std::string("unrecognized request")); }
 
 void Transaction::done() {
+  saveStoredAnnotations();
   tn::Value reply(reply_);
   TN_PROBE_REQUEST_OUTPUT(client_->pid(), [&] { return reply.description(); });
-  if (auto c = connection()) c->sendReply(request_, std::move(reply));
+  if (auto c = connection()) {
+    tn::Result<void> sent = c->trySendReply(request_, std::move(reply));
+    if (!sent && relay::isRelayError(sent.error(), relay::RelayErrorCode::MessageTooLarge)) {
+      sendReplyTooLarge(*c, sent.error());
+    }
+  }
+  request_.charge.reset();
+}
+
+void Transaction::sendReplyTooLarge(relay::Connection& connection, const tn::Error& error) {
+  const std::string* type = relay_dictionary_get_string(request(), "request");
+  TN_LOG_ERROR(tn::log::ops(), "reply to client {} for {} not sent: {}", client_->pid(),
+               type ? *type : std::string("(null)"), error.localizedDescription());
+  const tn::Dictionary replacement{
+      {"errorcode", tn::Value(uint64_t{kErrorReplyTooLarge})},
+      {"error", tn::Value(fmt::format("reply too large: {}; ask for less", error.localizedDescription()))}};
+  TN_PROBE_REQUEST_OUTPUT(client_->pid(), [&] { return tn::Value(replacement).description(); });
+  (void)connection.trySendReply(request_, tn::Value(replacement));
 }
 
 void Transaction::fail(uint64_t code, const std::optional<std::string>& message) {
@@ -94,13 +120,15 @@ bool Transaction::marshalPaths(const PathOperation& operation) {
       return false;
     }
     if (path->empty() || path->front() != '/') {
-      fail(kErrorBadPath, fmt::format("absolute path required: {}", *path));
+      fail(kErrorBadPath, fmt::format("absolute path required: {}", tn::log::escapeText(*path)));
       return false;
     }
     // A path that does not exist, or whose canonical form would not fit the
-    // 1024 bytes the daemon allows, goes on unresolved.
+    // 1024 bytes the daemon allows, goes on unresolved. So does a path with
+    // a NUL: it names nothing, and realpath would see only its first part.
     char resolved[PATH_MAX];
-    const bool ok = realpath(path->c_str(), resolved) != nullptr && std::strlen(resolved) < 1024;
+    const bool ok = path->find('\0') == std::string::npos && realpath(path->c_str(), resolved) != nullptr &&
+                    std::strlen(resolved) < 1024;
     if (!operation(ok ? std::string(resolved) : *path, ok)) return false;
   }
   return true;

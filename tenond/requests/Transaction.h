@@ -6,8 +6,8 @@
 //
 // Contract with the operations: each sends exactly one reply, by done() or
 // by fail(), which calls done(); after a fail() it stops. marshalPaths()
-// sends its own failure replies; a per-path operation that answers false
-// must have sent one itself.
+// and processUuidList() send their own failure replies; a per-path or
+// per-plug-in operation that answers false must have sent one itself.
 
 #include <cstdint>
 #include <functional>
@@ -21,6 +21,8 @@
 
 namespace tnd {
 
+class Discovery;
+class TNDHost;
 class TNDPlugIn;
 class TNDRelayClient;
 class TNDServer;
@@ -35,6 +37,7 @@ enum : uint64_t {
   kErrorBusy = 14,
   kErrorNotFound = 15,
   kErrorBadValue = 18,
+  kErrorReplyTooLarge = 21,  // the reply would not fit in a frame
 };
 
 inline constexpr uint64_t kCurrentProtocolVersion = 3;
@@ -43,13 +46,19 @@ class Transaction {
  public:
   // (path, resolved) → keep walking?
   using PathOperation = std::function<bool(const std::string& path, bool resolved)>;
+  // (plug-in) → keep walking?
+  using PlugInOperation = std::function<bool(const std::shared_ptr<TNDPlugIn>& plugIn)>;
 
   Transaction(relay::Message request, std::shared_ptr<TNDRelayClient> client);
 
   // Runs the request. On the service queue.
   void dispatch();
 
-  // Sends the reply on the connection (nothing when it is gone).
+  // Sends the reply on the connection (nothing when it is gone). A reply
+  // too large for a frame is replaced by an error reply (21), so that every
+  // request still gets exactly one answer. Gives the request's share of the
+  // client's budget back. Annotation changes the request made are written
+  // to the annotation file first (storeAnnotation).
   void done();
   // Sets errorcode and error (when given) in the reply, then done().
   void fail(uint64_t code, const std::optional<std::string>& message);
@@ -63,6 +72,16 @@ class Transaction {
   bool marshalPaths(const PathOperation& operation);
   // marshalPaths, then done() when the walk succeeded.
   bool processPaths(const PathOperation& operation);
+
+  // Resolves the request's `uuids` array to plug-ins, in order, and hands
+  // each to `operation`; a UUID the database does not know falls back to
+  // element i of a `paths` array of the same length (a file-system path).
+  // Fails the request itself (code 4) for a missing `uuids` array, an
+  // element that is not a UUID, or a plug-in found neither way, and then
+  // answers false; an operation that answers false stops the walk (it must
+  // have replied). True when every element was handed over: the caller
+  // replies. What earlier elements' operations did stays done.
+  bool processUuidList(const PlugInOperation& operation);
 
   const std::shared_ptr<TNDRelayClient>& client() const { return client_; }
   const tn::Value& request() const { return request_.body; }
@@ -80,16 +99,46 @@ class Transaction {
   static const Route kRoutes[];
 
   void route(const std::string* type);
+  void sendReplyTooLarge(relay::Connection& connection, const tn::Error& error);
   void unrecognized();
 
   // Lookup requests (LookupRequests.cpp).
   void findPlugIn();
   std::shared_ptr<TNDPlugIn> findPlugInByUUID(const tn::UUID& uuid);
   std::shared_ptr<TNDPlugIn> findPlugInByPathURL(const std::string& text);
+  // The walk's fallback for an unknown UUID: the plug-in at `path` (logged).
+  std::shared_ptr<TNDPlugIn> findPlugInByFallbackPath(const tn::UUID& uuid, const tn::Value& path);
   // Sets the form's "annotations": the stored annotation, else an empty one.
   void addAnnotationForPlugIn(const TNDPlugIn& plugIn, tn::Dictionary& form);
   // The policy hook for plug-ins without a stored annotation: no for all.
   static bool pluginShouldBeAutoEnabled(const TNDPlugIn& plugIn);
+
+  // Discovery requests (DiscoveryRequests.cpp): "match", and "explain"
+  // (why one plug-in is or is not offered to a host).
+  struct DiscoveryInput {
+    tn::Value rules;  // a dictionary, or null
+    uint64_t flags = 0;
+  };
+  void matchPlugIns();
+  void explainPlugIn();
+  // The request's rules and flags, checked (bad rules: 4; TNDiscoverAll
+  // from a client that may not: 11); none when the request failed.
+  std::optional<DiscoveryInput> discoveryInput();
+  Discovery makeDiscovery(const DiscoveryInput& input, std::shared_ptr<const TNDHost> host, bool log);
+  // "explain"'s host (the client, or for a manager the executable named by
+  // "host") and plug-in ("uuids" or "paths"); none when the request failed.
+  std::shared_ptr<const TNDHost> explainedHost();
+  std::shared_ptr<TNDPlugIn> explainedPlugIn();
+  // Annotation requests (AnnotationRequests.cpp).
+  void annotatePlugIns();
+  void bulkAnnotatePlugIns();
+  // Stores an annotation change for the plug-in with its save deferred
+  // until just before the reply (done()), so that a request writes the
+  // annotation file once, yet every change it made is on disk when it
+  // answers, failed or not.
+  std::optional<tn::Error> storeAnnotation(const tn::Dictionary& change, const TNDPlugIn& plugIn);
+  // Writes what storeAnnotation deferred; done() does it at the latest.
+  void saveStoredAnnotations();
 
   // Registration requests (RegistrationRequests.cpp).
   void addPlugIns();
@@ -97,9 +146,10 @@ class Transaction {
   void bulkPlugIns();
 
   const std::shared_ptr<TNDRelayClient> client_;
-  const relay::Message request_;
+  relay::Message request_;  // its charge is given back by done()
   tn::Dictionary reply_;
   uint64_t version_ = 0;
+  bool annotationsUnsaved_ = false;  // see storeAnnotation
 };
 
 }  // namespace tnd

@@ -8,6 +8,7 @@
 #include "platform/log/Log.h"
 #include "platform/relay/SocketActivation.h"
 #include "tenond/server/CommandLine.h"
+#include "tenond/server/FileLimit.h"
 #include "tenond/server/TNDServer.h"
 
 namespace tnd {
@@ -25,6 +26,7 @@ int runDaemon(int argc, char** argv) {
     return 2;
   }
 
+  raiseFileLimit();
   std::shared_ptr<TNDServer> server = TNDServer::initForService(line->serviceName, line->databasePath);
   if (!server) {
     TN_LOG_ERROR(tn::log::ops(), "unable to construct server");

@@ -29,6 +29,7 @@ class TNDPlugInHold {
   const tn::UUID& uuid() const { return uuid_; }
   bool blocks(const tn::UUID& plugIn) const { return blocked_.count(plugIn) != 0; }
   size_t blockedCount() const { return blocked_.size(); }
+  const std::unordered_set<tn::UUID>& blocked() const { return blocked_; }
   // The client, or none once it has been destroyed.
   std::shared_ptr<TNDRelayClient> client() const { return client_.lock(); }
   // True when the hold was placed by this very client object (compared by

@@ -7,6 +7,9 @@
 #include "platform/log/Log.h"
 #include "platform/notify/Notify.h"
 #include "platform/relay/RelayError.h"
+#include "platform/types/TypeHierarchy.h"
+#include "tenond/QueueRanks.h"
+#include "tenond/server/FileLimit.h"
 #include "tenond/server/TNDPlugInHold.h"
 #include "tenond/server/TNDRelayClient.h"
 
@@ -21,11 +24,15 @@ std::shared_ptr<TNDServer> gServer;  // the process's one server
 std::shared_ptr<TNDServer> TNDServer::initForService(const std::string& serviceName,
                                                      const std::optional<std::string>& databasePath) {
   std::shared_ptr<TNDServer> server(new TNDServer());
+  server->configuration_ = TNDConfiguration::load();
   if (!server->initWithDatabase(databasePath, tn::dispatch::mainQueue())) return nullptr;
 
   server->relayQueue_ = tn::dispatch::SerialQueue::create("relay");
   server->mainQueue_ = tn::dispatch::SerialQueue::create("service", kServiceQualityOfService);
+  server->mainQueue_->setLockRank(kServiceQueueRank);
+  server->serviceTurns_ = tn::dispatch::FairQueue::create(server->mainQueue_);
   server->syncQueue_ = tn::dispatch::SerialQueue::create("serverSync");
+  server->syncQueue_->setLockRank(kLeafQueueRank);
 
   auto listener = relay::Listener::create(serviceName, server->relayQueue_);
   if (!listener) {
@@ -33,11 +40,26 @@ std::shared_ptr<TNDServer> TNDServer::initForService(const std::string& serviceN
     return nullptr;
   }
   server->service_ = std::move(*listener);
+  const relay::Listener::Limits limits =
+      connectionLimits(currentFileLimit(), server->configuration_.connectionsPerUser,
+                       server->configuration_.connectionsTotal);
+  server->service_->setLimits(limits);
+  TN_LOG_DEBUG(tn::log::ops(), "connections: at most {} per user, {} in all ({} kept for root), {} requests "
+               "outstanding per connection", limits.connectionsPerUser, limits.connectionsTotal,
+               limits.privilegedReserve, limits.outstandingRequests);
   {
     std::lock_guard lock(gServerMutex);
     gServer = server;
   }
   server->setDelegate(server);
+  // Matching reads elections through the server's database, and the type
+  // hierarchy is loaded (its problems logged) now rather than at the first
+  // match.
+  TNDMatchContext::setAnnotationSource([](const TNDPlugIn& plugIn) -> std::optional<tn::Dictionary> {
+    const std::shared_ptr<TNDServer> current = TNDServer::server();
+    return current ? current->annotationForPlugIn(plugIn) : std::nullopt;
+  });
+  types::TypeHierarchy::system();
   server->installListenerHandlers();
   return server;
 }
@@ -66,7 +88,17 @@ void TNDServer::run() {
   tn::dispatch::runMainLoop();
 }
 
-void TNDServer::submitWork(std::function<void()> work) { mainQueue_->async(std::move(work)); }
+void TNDServer::submitWork(const TNDRelayClient* client, std::function<void()> work) {
+  serviceTurns_->async(client, std::move(work));
+}
+
+// Hold changes post outside "serverSync": a post touches the file system,
+// and nothing that can stall (however briefly) belongs inside the queue that
+// every hold change and SIGTERM go through. Each function collects how many
+// holds it released inside the queue and posts that many times after it.
+void TNDServer::postAnnotationChanges(size_t count) {
+  for (size_t i = 0; i < count; ++i) notifyAnnotationChange();
+}
 
 void TNDServer::stop() {
   service_->cancel();
@@ -74,8 +106,8 @@ void TNDServer::stop() {
     for (const auto& hold : holds_)
       TN_LOG_DEBUG(tn::log::ops(), "releasing plug-in hold {} because server is stopping", hold->uuid().string());
     holds_.clear();
-    notifyAnnotationChange();
   });
+  postAnnotationChanges(1);  // one, even with no holds
 }
 
 bool TNDServer::holdOnPlugIn(const tn::UUID& plugIn) {
@@ -86,34 +118,43 @@ bool TNDServer::holdOnPlugIn(const tn::UUID& plugIn) {
   });
 }
 
+std::unordered_set<tn::UUID> TNDServer::heldPlugIns() {
+  return syncQueue_->sync([&] {
+    std::unordered_set<tn::UUID> held;
+    for (const auto& hold : holds_) held.insert(hold->blocked().begin(), hold->blocked().end());
+    return held;
+  });
+}
+
 void TNDServer::addHold(std::shared_ptr<TNDPlugInHold> hold) {
   syncQueue_->sync([&] { holds_.push_back(std::move(hold)); });
-  notifyAnnotationChange();
+  postAnnotationChanges(1);
 }
 
 void TNDServer::unholdToken(const tn::UUID& token) {
-  syncQueue_->sync([&] {
+  const size_t released = syncQueue_->sync([&]() -> size_t {
     for (auto it = holds_.begin(); it != holds_.end(); ++it) {
       if ((*it)->uuid() != token) continue;
       TN_LOG_DEBUG(tn::log::ops(), "releasing plug-in hold {} at client's request", token.string());
       holds_.erase(it);
-      notifyAnnotationChange();
-      return;
+      return 1;
     }
+    return 0;
   });
+  postAnnotationChanges(released);
 }
 
 void TNDServer::unholdClient(const std::shared_ptr<TNDRelayClient>& client) {
-  syncQueue_->sync([&] {
-    for (;;) {
-      auto it = std::find_if(holds_.begin(), holds_.end(), [&](const auto& h) { return h->placedBy(client); });
-      if (it == holds_.end()) return;
-      TN_LOG_DEBUG(tn::log::ops(), "releasing plug-in hold {} for dead client pid {}", (*it)->uuid().string(),
-                   client->pid());
-      holds_.erase(it);
-      notifyAnnotationChange();
+  const size_t released = syncQueue_->sync([&]() -> size_t {
+    const auto placed = [&](const auto& hold) { return hold->placedBy(client); };
+    for (const auto& hold : holds_) {
+      if (placed(hold))
+        TN_LOG_DEBUG(tn::log::ops(), "releasing plug-in hold {} for dead client pid {}", hold->uuid().string(),
+                     client->pid());
     }
+    return std::erase_if(holds_, placed);
   });
+  postAnnotationChanges(released);
 }
 
 size_t TNDServer::holdCount() {

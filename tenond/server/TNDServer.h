@@ -8,10 +8,12 @@
 // database (it derives from TNDatabase) and that database's delegate.
 //
 // Queues: "relay" gets the listener's events; "service" (quality of service
-// 25) runs every transaction of every client, one at a time, in submission
-// order; "serverSync" guards the hold list and is only entered
-// synchronously. Lock order: "service" may enter "serverSync"; code on
-// "serverSync" enters no other queue.
+// 25) runs every transaction of every client, one at a time, taking the
+// clients with work in turn (a FairQueue: one transaction per client, round
+// robin, each client's in the order it sent them); "serverSync" guards the
+// hold list and is only entered synchronously. Lock order (QueueRanks.h):
+// "service" may enter "serverSync"; code on "serverSync" enters no other
+// queue.
 
 #include <atomic>
 #include <cstdint>
@@ -19,12 +21,15 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <unordered_set>
 #include <vector>
 
+#include "platform/dispatch/FairQueue.h"
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/relay/Listener.h"
 #include "tenond/database/TNDUserPrefs.h"
 #include "tenond/database/TNDatabase.h"
+#include "tenond/server/TNDConfiguration.h"
 
 namespace tnd {
 
@@ -51,16 +56,22 @@ class TNDServer final : public TNDatabase,
   // Resumes the listener, then runs the main loop for good.
   [[noreturn]] void run();
 
-  // Queues `work` on the service queue and returns at once.
-  void submitWork(std::function<void()> work);
+  // Queues `work` on the service queue for `client` and returns at once.
+  // Work of one client runs in the order submitted; clients take turns.
+  void submitWork(const TNDRelayClient* client, std::function<void()> work);
 
   // Cancels the listener, releases every hold and posts the
   // annotation-change notification (even with no holds). Runs on the main
   // queue (the SIGTERM handler).
   void stop();
 
-  // Holds. All of them enter "serverSync" synchronously.
+  // Holds. All of them enter "serverSync" synchronously; those that change
+  // the list post one annotation-change notification per hold added or
+  // released, after leaving "serverSync".
   bool holdOnPlugIn(const tn::UUID& plugIn);
+  // Every plug-in some hold blocks now: one visit to "serverSync" for a
+  // request that asks about many plug-ins.
+  std::unordered_set<tn::UUID> heldPlugIns();
   void addHold(std::shared_ptr<TNDPlugInHold> hold);
   void unholdToken(const tn::UUID& token);
   void unholdClient(const std::shared_ptr<TNDRelayClient>& client);
@@ -77,19 +88,24 @@ class TNDServer final : public TNDatabase,
   const std::shared_ptr<tn::dispatch::SerialQueue>& syncQueue() const { return syncQueue_; }
   // The reader of the user's preferences (exclusions), made at start-up.
   const TNDUserPrefs& userPrefs() const { return userPrefs_; }
+  // The administrator's settings (tenond.manifest), read once at start-up.
+  const TNDConfiguration& configuration() const { return configuration_; }
   const std::shared_ptr<relay::Listener>& service() const { return service_; }
 
  private:
   TNDServer() = default;
   void installListenerHandlers();
+  void postAnnotationChanges(size_t count);
 
   std::atomic<uint32_t> verbose_{0};
   std::shared_ptr<tn::dispatch::SerialQueue> relayQueue_;
   std::shared_ptr<tn::dispatch::SerialQueue> mainQueue_;
+  std::shared_ptr<tn::dispatch::FairQueue> serviceTurns_;  // on mainQueue_
   std::shared_ptr<tn::dispatch::SerialQueue> syncQueue_;
   std::shared_ptr<relay::Listener> service_;
   std::vector<std::shared_ptr<TNDPlugInHold>> holds_;  // on syncQueue_ only
   TNDUserPrefs userPrefs_;
+  TNDConfiguration configuration_;
 };
 
 }  // namespace tnd

@@ -11,19 +11,23 @@
 #include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
+#include "tests/support/TrustedInstall.h"
 
 namespace tn::test {
 namespace {
 
-const std::string kTnctl = std::string(TENON_BINARY_DIR) + "/tools/tnctl/tnctl";
+const std::string kTnctl = std::string(TENON_BINARY_DIR "/tools/tnctl/tnctl");
 
 class Lookup : public ::testing::Test {
  protected:
   void SetUp() override {
     ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
     const std::string applications = daemon_.root() + "/opt/tenon/applications";
-    std::filesystem::copy(std::string(TENON_SOURCE_DIR) + "/examples/applications/Messenger",
-                          daemon_.root() + "/Messenger", std::filesystem::copy_options::recursive);
+    // The plug-in's auto-elect entitlement counts only with trusted modes,
+    // which neither the checkout's nor the daemon's directories (made with
+    // the umask's modes) may have.
+    installTree(std::string(TENON_SOURCE_DIR "/examples/applications/Messenger"), daemon_.root(), "Messenger");
+    trustDirectoriesBetween(daemon_.root(), applications + "/Messenger");
     std::filesystem::rename(daemon_.root() + "/Messenger", applications + "/Messenger");
     plugIn_ = applications + "/Messenger/Support/PlugIns/ShareToChat";
     for (int i = 0; i < 500 && registered().empty(); ++i) std::this_thread::sleep_for(std::chrono::milliseconds(20));

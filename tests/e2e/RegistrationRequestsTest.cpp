@@ -1,7 +1,9 @@
 // "add", "remove" and "bulk" end to end: tnctl against the real tenond on a
 // private root, with the real registrar behind it, the manager entitlement
 // granted (or not) by the document that scripts/install-entitlements
-// installs, and applications copied into a watched root while it runs.
+// installs for a copy of tnctl in the root (the build directory's modes
+// depend on the umask), and applications copied into a watched root while
+// it runs.
 
 #include <gtest/gtest.h>
 
@@ -15,11 +17,12 @@
 #include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
+#include "tests/support/TrustedInstall.h"
 
 namespace tn::test {
 namespace {
 
-const std::string kTnctl = std::string(TENON_BINARY_DIR) + "/tools/tnctl/tnctl";
+const std::string kTnctl = std::string(TENON_BINARY_DIR "/tools/tnctl/tnctl");
 
 void writePlugIn(const std::string& bundle, const std::string& identifier) {
   makeBundle(bundle, R"({"BNBundleIdentifier": ")" + identifier + R"(", "BNBundleVersion": "1",
@@ -33,14 +36,18 @@ class Registration : public ::testing::Test {
   void SetUp() override { ASSERT_TRUE(daemon_.accepting()) << daemon_.log(); }
 
   ProcessResult tnctl(std::vector<std::string> arguments) {
-    arguments.insert(arguments.begin(), kTnctl);
+    arguments.insert(arguments.begin(), tnctl_);
     arguments.insert(arguments.end(), {"--service", daemon_.service()});
     return runProcess(arguments, daemon_.environment());
   }
+  // From now on tnctl() runs a trusted copy of tnctl that the manager
+  // entitlement names.
   void grantManagerEntitlement() {
-    const auto installed = runProcess({std::string(TENON_SOURCE_DIR) + "/scripts/install-entitlements",
-                                       daemon_.root(), kTnctl});
+    const std::string copy = installFile(kTnctl, daemon_.root(), "usr/bin/tnctl");
+    const auto installed = runProcess({std::string(TENON_SOURCE_DIR "/scripts/install-entitlements"),
+                                       daemon_.root(), copy});
     ASSERT_EQ(installed.exitStatus, 0) << installed.err;
+    tnctl_ = copy;
   }
   // The registrar's plug-ins as tnctl lists them from the store.
   std::string registryListing() { return tnctl({"registry", "list"}).out; }
@@ -55,6 +62,7 @@ class Registration : public ::testing::Test {
   }
 
   DaemonProcess daemon_{tenondBinaryPath()};
+  std::string tnctl_ = kTnctl;
 };
 
 TEST_F(Registration, AddRegistersInOrderAndStopsAtTheFirstBadPath) {
@@ -108,7 +116,7 @@ TEST_F(Registration, RemoveNeedsTheManagerEntitlement) {
       << "no paths: nothing to refuse";
 
   grantManagerEntitlement();
-  EXPECT_EQ(tnctl({"remove", bundle}).exitStatus, 0);
+  EXPECT_EQ(tnctl({"remove", bundle}).exitStatus, 0) << daemon_.log();
   EXPECT_EQ(registryListing().find("com.example.removable"), std::string::npos);
   const auto gone = tnctl({"remove", bundle});
   EXPECT_EQ(gone.err, "tnctl: error 9: no plugin at " + bundle + "\n");

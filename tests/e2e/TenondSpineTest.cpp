@@ -17,6 +17,7 @@
 #include "platform/notify/Post.h"
 #include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/RelayPeer.h"
 #include "tests/support/Subprocess.h"
 
 namespace tn::test {
@@ -40,37 +41,7 @@ uint64_t annotationChangeCount(const std::string& root) {
   return count ? *count : 0;
 }
 
-// A connection to the daemon that waits for each reply.
-class Client {
- public:
-  explicit Client(const std::string& service) : queue_(dispatch::SerialQueue::create("e2e-client")) {
-    auto c = relay::Connection::connectToService(service, queue_);
-    if (c) {
-      connection_ = *c;
-      connection_->setEventHandler([](const relay::Event&) {});
-      connection_->resume();
-    }
-  }
-  bool connected() const { return connection_ != nullptr; }
-
-  // The reply dictionary, or null when none came (error or 5 s of silence).
-  Value request(Dictionary body) {
-    dispatch::Semaphore done;
-    Value reply;
-    connection_->sendWithReply(Value(std::move(body)), queue_, [&](relay::Reply r) {
-      if (r) reply = *r;
-      done.signal();
-    });
-    if (!done.waitFor(std::chrono::seconds(5))) return Value();
-    return reply;
-  }
-
-  std::shared_ptr<relay::Connection>& connection() { return connection_; }
-
- private:
-  std::shared_ptr<dispatch::SerialQueue> queue_;
-  std::shared_ptr<relay::Connection> connection_;
-};
+using Client = RelayPeer;
 
 void expectError(const Value& reply, uint64_t code, const std::string& message) {
   EXPECT_EQ(reply["errorcode"], Value(code)) << reply.description();

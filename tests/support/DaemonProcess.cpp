@@ -52,9 +52,12 @@ std::vector<char*> pointersTo(std::vector<std::string>& strings) {
 
 }  // namespace
 
-DaemonProcess::DaemonProcess(std::string binary, std::vector<std::string> arguments) {
+DaemonProcess::DaemonProcess(std::string binary, std::vector<std::string> arguments,
+                             const std::function<void(const std::string& root)>& prepare) {
   root_ = (std::filesystem::temp_directory_path() / ("tenond-test-" + uniqueSuffix())).string();
   std::filesystem::create_directories(root_);
+  std::filesystem::permissions(root_, std::filesystem::perms(0755));
+  if (prepare) prepare(root_);
   service_ = "com.ostrel.tenon.test." + uniqueSuffix();
   logPath_ = root_ + "/tenond.log";
 

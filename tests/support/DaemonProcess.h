@@ -8,6 +8,11 @@
 //   ASSERT_TRUE(daemon.accepting()) << daemon.log();
 //   runProcess({tnctl, "match", "--service", daemon.service()}, daemon.environment());
 //
+// The root is made with mode 0755 whatever the umask (the daemon trusts
+// documents only in directories nobody else may write to); `prepare`, when
+// given, runs on it before the daemon starts, for what the daemon reads at
+// start-up (its configuration, say).
+//
 // The constructor returns once the daemon's socket accepts connections (or
 // the daemon exited, or 10 seconds passed). It does not change this
 // process's environment: subprocesses get environment(); a test that talks
@@ -19,6 +24,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -26,14 +32,15 @@ namespace tn::test {
 
 #ifdef TENON_BINARY_DIR
 // Where the build puts the daemon (test programs define TENON_BINARY_DIR).
-inline std::string tenondBinaryPath() { return std::string(TENON_BINARY_DIR) + "/tenond/tenond"; }
+inline std::string tenondBinaryPath() { return std::string(TENON_BINARY_DIR "/tenond/tenond"); }
 #endif
 
 class DaemonProcess {
  public:
   // Starts `binary` (usually tenondBinaryPath()) with "-S <unique service>"
-  // followed by `arguments`.
-  explicit DaemonProcess(std::string binary, std::vector<std::string> arguments = {});
+  // followed by `arguments`, after prepare(root()).
+  explicit DaemonProcess(std::string binary, std::vector<std::string> arguments = {},
+                         const std::function<void(const std::string& root)>& prepare = {});
   ~DaemonProcess();
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;

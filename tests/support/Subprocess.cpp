@@ -39,7 +39,66 @@ void drain(int outFd, int errFd, std::string& out, std::string& err) {
   }
 }
 
+std::vector<char*> pointersTo(std::vector<std::string>& strings) {
+  std::vector<char*> pointers;
+  for (std::string& text : strings) pointers.push_back(text.data());
+  pointers.push_back(nullptr);
+  return pointers;
+}
+
+int reap(pid_t pid) {
+  int status = 0;
+  while (waitpid(pid, &status, 0) < 0 && errno == EINTR) {
+  }
+  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
 }  // namespace
+
+std::vector<std::string> environmentWith(const std::vector<std::string>& extraEnvironment) {
+  // The extra entries replace inherited ones of the same name.
+  auto overridden = [&](const std::string& entry) {
+    const std::string name = entry.substr(0, entry.find('=') + 1);
+    for (const auto& extra : extraEnvironment)
+      if (extra.starts_with(name)) return true;
+    return false;
+  };
+  std::vector<std::string> entries;
+  for (char** e = environ; *e; ++e)
+    if (!overridden(*e)) entries.emplace_back(*e);
+  entries.insert(entries.end(), extraEnvironment.begin(), extraEnvironment.end());
+  return entries;
+}
+
+void ChildProcess::start(std::vector<std::string> argv, std::vector<std::string> env, bool (*setUp)(void*),
+                         void* context) {
+  int out[2], err[2];
+  if (pipe2(out, O_CLOEXEC) != 0 || pipe2(err, O_CLOEXEC) != 0) return;
+  std::vector<char*> argp = pointersTo(argv);
+  std::vector<char*> envp = pointersTo(env);
+  pid_ = fork();
+  if (pid_ == 0) {
+    const int in = open("/dev/null", O_RDONLY);
+    dup2(in, STDIN_FILENO);
+    dup2(out[1], STDOUT_FILENO);
+    dup2(err[1], STDERR_FILENO);
+    if (!setUp(context)) _exit(kSetUpFailed);
+    execve(argp[0], argp.data(), envp.data());
+    _exit(127);
+  }
+  close(out[1]);
+  close(err[1]);
+  out_ = out[0];
+  err_ = err[0];
+}
+
+ProcessResult ChildProcess::finish() {
+  if (pid_ <= 0) return result_;
+  drain(out_, err_, result_.out, result_.err);
+  result_.exitStatus = reap(pid_);
+  pid_ = -1;
+  return result_;
+}
 
 ProcessResult runProcess(const std::vector<std::string>& argv, const std::vector<std::string>& extraEnvironment) {
   ProcessResult result;
@@ -55,20 +114,8 @@ ProcessResult runProcess(const std::vector<std::string>& argv, const std::vector
   std::vector<char*> args;
   for (const auto& a : argv) args.push_back(const_cast<char*>(a.c_str()));
   args.push_back(nullptr);
-  // The extra entries replace inherited ones of the same name.
-  auto overridden = [&](const std::string& entry) {
-    const std::string name = entry.substr(0, entry.find('=') + 1);
-    for (const auto& extra : extraEnvironment)
-      if (extra.starts_with(name)) return true;
-    return false;
-  };
-  std::vector<std::string> envStrings;
-  for (char** e = environ; *e; ++e)
-    if (!overridden(*e)) envStrings.emplace_back(*e);
-  envStrings.insert(envStrings.end(), extraEnvironment.begin(), extraEnvironment.end());
-  std::vector<char*> env;
-  for (auto& e : envStrings) env.push_back(e.data());
-  env.push_back(nullptr);
+  std::vector<std::string> envStrings = environmentWith(extraEnvironment);
+  std::vector<char*> env = pointersTo(envStrings);
 
   pid_t pid = -1;
   const int spawned = posix_spawn(&pid, args[0], &actions, nullptr, args.data(), env.data());
@@ -82,10 +129,7 @@ ProcessResult runProcess(const std::vector<std::string>& argv, const std::vector
     return result;
   }
   drain(outPipe[0], errPipe[0], result.out, result.err);
-  int status = 0;
-  while (waitpid(pid, &status, 0) < 0 && errno == EINTR) {
-  }
-  result.exitStatus = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  result.exitStatus = reap(pid);
   return result;
 }
 

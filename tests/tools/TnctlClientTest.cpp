@@ -22,9 +22,9 @@
 namespace tn {
 namespace {
 
-const std::string kTnctl = std::string(TENON_BINARY_DIR) + "/tools/tnctl/tnctl";
+const std::string kTnctl = std::string(TENON_BINARY_DIR "/tools/tnctl/tnctl");
 const std::string kPython = "/usr/bin/python3";
-const std::string kPythonClient = std::string(TENON_SOURCE_DIR) + "/examples/python/tenon_client.py";
+const std::string kPythonClient = std::string(TENON_SOURCE_DIR "/examples/python/tenon_client.py");
 
 size_t lineCount(const std::string& text) { return static_cast<size_t>(std::count(text.begin(), text.end(), '\n')); }
 
@@ -67,14 +67,16 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
   // (the ones it does not serve yet say so).
   for (std::vector<std::string> operation : std::vector<std::vector<std::string>>{
            {"match"},
-           {"match", "--rules", R"({"XTExtensionPoint":"com.example.filter"})", "--flags", "0x1"},
-           {"release", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"},
+           {"match", "--rules", R"({"XTExtensionPoint":"com.example.filter"})", "--flags", "all-versions"},
        }) {
     const auto result = tnctl(operation);
-    EXPECT_EQ(result.exitStatus, 1) << operation[0];
-    EXPECT_EQ(result.err, "tnctl: error 4: unrecognized request\n") << operation[0];
-    EXPECT_EQ(result.out, "") << operation[0];
+    EXPECT_EQ(result.exitStatus, 0) << result.err;
+    EXPECT_EQ(result.out, "no plug-ins offered\n");
   }
+  const auto release = tnctl({"release", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"});
+  EXPECT_EQ(release.exitStatus, 1);
+  EXPECT_EQ(release.err, "tnctl: error 4: unrecognized request\n");
+  EXPECT_EQ(release.out, "");
   EXPECT_EQ(tnctl({"find", "--uuid", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"}).err,
             "tnctl: error 15: Cannot locate PlugIn\n");
   const auto added = tnctl({"add", "/opt/A.tnx"});
@@ -84,7 +86,7 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
 }
 
 TEST_F(TnctlClient, JsonOutputIsTheReplyAsADocument) {
-  const auto result = tnctl({"--json", "match"});
+  const auto result = tnctl({"--json", "release", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"});
   EXPECT_EQ(result.exitStatus, 1);
   auto reply = readDocument(result.out, "stdout", DocumentEncoding::Json);
   ASSERT_TRUE(reply) << reply.error().localizedDescription() << "\n" << result.out;
@@ -122,11 +124,14 @@ TEST(TnctlUnreachable, AMissingDaemonGivesOneClearLine) {
 // sends for its arguments: a fake daemon in this process answers it.
 class TnctlReplies : public ::testing::Test {
  protected:
+  // Plug-in b carries the user's election, a none.
   static Value form(const char* identifier, const char* version, const char* uuid) {
-    return Value(Dictionary{{"identifier", Value(identifier)},
-                            {"version", Value(version)},
-                            {"uuid", Value(uuid)},
-                            {"lastmodified", Value(int64_t{1700000000})}});
+    Dictionary form{{"identifier", Value(identifier)},
+                    {"version", Value(version)},
+                    {"uuid", Value(uuid)},
+                    {"lastmodified", Value(int64_t{1700000000})}};
+    if (std::string(identifier) == "com.example.b") form.set("annotations", Value(Dictionary{{"election", 1}}));
+    return Value(std::move(form));
   }
 
   static Value answer(const Value& request) {
@@ -164,9 +169,12 @@ class TnctlReplies : public ::testing::Test {
 TEST_F(TnctlReplies, ReadableOutputListsFormsTokensAndTheHoldToken) {
   const auto match = tnctl({"match"});
   EXPECT_EQ(match.exitStatus, 0) << match.err;
-  EXPECT_EQ(match.out, std::string("com.example.a 1.0 ") + kUuidA + "\ncom.example.b 2.1 " + kUuidB + "\n");
+  const std::string row = "{:<40} {:<8} {:<8} {:<36} {}\n";
+  EXPECT_EQ(match.out, fmt::format(fmt::runtime(row), "IDENTIFIER", "VERSION", "ELECTION", "UUID", "LOCATION") +
+                           fmt::format(fmt::runtime(row), "com.example.a", "1.0", "-", kUuidA, "-") +
+                           fmt::format(fmt::runtime(row), "com.example.b", "2.1", "1", kUuidB, "-"));
 
-  EXPECT_EQ(tnctl({"find", "--uuid", kUuidA}).out, std::string("com.example.a 1.0 ") + kUuidA + "\n");
+  EXPECT_EQ(tnctl({"find", "--uuid", kUuidA}).out, std::string("com.example.a 1.0 ") + kUuidA + " no election\n");
   EXPECT_EQ(tnctl({"hold", "/opt/App"}).out, std::string(kUuidB) + "\n");
   EXPECT_EQ(tnctl({"access", std::string(kUuidA) + "=/opt/A.tnx"}).out, "token-1\ntoken-2\n");
 
@@ -211,7 +219,24 @@ TEST_F(TnctlReplies, ArgumentsBecomeTheRequestsKeys) {
 
   const Value& annotate = requests.at(1);
   EXPECT_EQ(annotate["uuids"], Value(Array{Value(*UUID::parse(kUuidA)), Value(*UUID::parse(kUuidB))}));
+  EXPECT_FALSE(annotate.dictionary()->contains("paths")) << "no plug-in named by path";
   EXPECT_EQ(annotate["annotations"], Value(Dictionary{{"election", Value(0)}}));
+}
+
+// A plug-in named by path goes with the nil UUID, which names none, so that
+// the daemon looks it up by its path; one named by UUID with an empty path.
+TEST_F(TnctlReplies, AnnotatePairsPathsWithTheNilUuid) {
+  const auto annotated = tnctl({"annotate", "--uuid", kUuidA, "--path", "/opt/A.app/Support/PlugIns/P.tnx",
+                                "--election", "1", "--extension", R"({"k": [1]})"});
+  ASSERT_EQ(annotated.exitStatus, 0) << annotated.err;
+  EXPECT_EQ(annotated.out, "annotated 2 plug-ins: {election: 1, extension: {k: [1]}}\n");
+  const std::vector<Value> requests = daemon_.waitForRequests(1);
+  ASSERT_EQ(requests.size(), 1u);
+  const Value& annotate = requests.at(0);
+  EXPECT_EQ(annotate["uuids"], Value(Array{Value(*UUID::parse(kUuidA)), Value(UUID())}));
+  EXPECT_EQ(annotate["paths"], Value(Array{Value(""), Value("/opt/A.app/Support/PlugIns/P.tnx")}));
+  EXPECT_EQ(annotate["annotations"],
+            Value(Dictionary{{"election", Value(1)}, {"extension", Value(Dictionary{{"k", Value(Array{Value(1)})}})}}));
 }
 
 class PythonClient : public TnctlClient {
@@ -255,7 +280,7 @@ TEST(PythonTypedEncoding, DecodesFormsAsTheDaemonEncodesThem) {
       "form = t.decode_typed(bytes.fromhex(sys.argv[2])); "
       "print(t.to_json({'values': form, 'kinds': {k: type(v).__name__ for k, v in form.items()}}))";
   const auto result = test::runProcess(
-      {kPython, "-c", script, std::string(TENON_SOURCE_DIR) + "/examples/python", hex});
+      {kPython, "-c", script, std::string(TENON_SOURCE_DIR "/examples/python"), hex});
   ASSERT_EQ(result.exitStatus, 0) << result.err;
   auto output = readDocument(result.out, "stdout", DocumentEncoding::Json);
   ASSERT_TRUE(output) << result.out;

@@ -14,8 +14,8 @@ namespace {
 
 namespace fs = std::filesystem;
 
-const std::string kTnctl = std::string(TENON_BINARY_DIR) + "/tools/tnctl/tnctl";
-const std::string kExamples = std::string(TENON_SOURCE_DIR) + "/examples/documents/";
+const std::string kTnctl = std::string(TENON_BINARY_DIR "/tools/tnctl/tnctl");
+const std::string kExamples = std::string(TENON_SOURCE_DIR "/examples/documents/");
 
 class TnctlDocument : public ::testing::Test {
  protected:

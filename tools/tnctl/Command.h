@@ -30,10 +30,12 @@ struct CommandFailed {
 void addDocumentCommand(CLI::App& app, const GlobalOptions& options);
 void addLintCommand(CLI::App& app, const GlobalOptions& options);  // lint BUNDLE
 void addRegistryCommands(CLI::App& app, const GlobalOptions& options);  // registry list|show|scan
+void addConsentCommands(CLI::App& app, const GlobalOptions& options);   // consent grant|revoke|list
 
 // Subcommands that talk to tenond, one per client operation.
 void addRegistrationCommands(CLI::App& app, const GlobalOptions& options);  // add, remove, bulk
-void addLookupCommands(CLI::App& app, const GlobalOptions& options);        // find, match
+void addLookupCommands(CLI::App& app, const GlobalOptions& options);        // find
+void addDiscoveryCommands(CLI::App& app, const GlobalOptions& options);     // match, explain
 void addReadinessCommands(CLI::App& app, const GlobalOptions& options);     // ready, access
 void addAnnotationCommands(CLI::App& app, const GlobalOptions& options);    // annotate, bulk-annotate
 void addHoldCommands(CLI::App& app, const GlobalOptions& options);          // hold, release

@@ -35,14 +35,33 @@ std::optional<tn::Error> errorIn(const relay::Reply& reply) {
 
 }  // namespace
 
-void runClientOperation(const GlobalOptions& options, const ClientOperation& operation) {
+namespace {
+
+void run(const GlobalOptions& options, const ClientOperation& operation, const ReadablePrinter& readable,
+         const std::string& emptySuccess) {
   tn::TNDaemonClient client(options.service);
   const relay::Reply reply = await(options, operation, client);
   if (!reply) failUnreachable(options, reply.error());
 
   const std::optional<tn::Error> error = errorIn(reply);
-  printReply(client, *reply, options.json, /*succeeded=*/!error);
+  if (readable && !error && !options.json) {
+    readable(client, *reply);
+  } else {
+    printReply(client, *reply, options.json, /*succeeded=*/!error, emptySuccess);
+  }
   if (error) fail(fmt::format("error {}: {}", error->code(), error->localizedDescription()));
+}
+
+}  // namespace
+
+void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
+                        const std::string& emptySuccess) {
+  run(options, operation, {}, emptySuccess);
+}
+
+void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
+                        const ReadablePrinter& readable) {
+  run(options, operation, readable, "ok");
 }
 
 }  // namespace tnctl

@@ -9,6 +9,7 @@
 //   tnctl: error <code>: <message>
 
 #include <functional>
+#include <string>
 
 #include "libtenon/client/TNDaemonClient.h"
 #include "tools/tnctl/Command.h"
@@ -18,8 +19,17 @@ namespace tnctl {
 // Starts one request: calls one operation of the client with the block.
 using ClientOperation = std::function<void(tn::TNDaemonClient& client, tn::TNDaemonClient::ReplyBlock reply)>;
 
+// Prints a successful reply for people (without --json), in place of the
+// generic readable printing (ReplyPrinter.h).
+using ReadablePrinter = std::function<void(const tn::TNDaemonClient& client, const tn::Value& reply)>;
+
 // Runs `operation` against the daemon and reports its reply on stdout;
 // fails the command when the daemon cannot be reached or reports an error.
-void runClientOperation(const GlobalOptions& options, const ClientOperation& operation);
+// A success that carries nothing reads `emptySuccess` in the readable form.
+void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
+                        const std::string& emptySuccess = "ok");
+// The same, with a success printed by `readable` for people.
+void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
+                        const ReadablePrinter& readable);
 
 }  // namespace tnctl

@@ -1,5 +1,4 @@
 // tnctl find --uuid U | --url URL             one plug-in's form ("find")
-// tnctl match [--rules JSON|@FILE] [--flags N]  discovery ("match")
 
 #include <memory>
 #include <string>
@@ -14,11 +13,6 @@ namespace {
 struct FindOptions {
   std::string uuid;
   std::string url;
-};
-
-struct MatchOptions {
-  std::string rules;
-  std::string flags = "0";
 };
 
 void addFindCommand(CLI::App& app, const GlobalOptions& options) {
@@ -43,27 +37,10 @@ void addFindCommand(CLI::App& app, const GlobalOptions& options) {
   });
 }
 
-void addMatchCommand(CLI::App& app, const GlobalOptions& options) {
-  auto arguments = std::make_shared<MatchOptions>();
-  CLI::App* command = app.add_subcommand("match", "Discover the plug-ins that match rules");
-  command->add_option("--rules", arguments->rules, "Rules dictionary: JSON, or @FILE");
-  command->add_option("--flags", arguments->flags, "Discovery flags (decimal or 0x hexadecimal)")
-      ->capture_default_str();
-  command->callback([&options, arguments] {
-    const tn::Dictionary rules = arguments->rules.empty() ? tn::Dictionary()
-                                                          : readDictionaryArgument(arguments->rules, "--rules");
-    const uint64_t flags = parseFlags(arguments->flags);
-    runClientOperation(options, [&](tn::TNDaemonClient& client, tn::TNDaemonClient::ReplyBlock reply) {
-      client.matchPlugIns(rules, flags, std::move(reply));
-    });
-  });
-}
-
 }  // namespace
 
 void addLookupCommands(CLI::App& app, const GlobalOptions& options) {
   addFindCommand(app, options);
-  addMatchCommand(app, options);
 }
 
 }  // namespace tnctl

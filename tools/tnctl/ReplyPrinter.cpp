@@ -18,7 +18,9 @@ std::string formLine(const tn::Value& form) {
   for (const char* key : {"identifier", "version", "uuid"}) {
     if (const std::string* text = form[key].string()) fields.push_back(*text);
   }
-  return fields.empty() ? form.description() : fmt::format("{}", fmt::join(fields, " "));
+  const tn::Value& election = form["annotations"]["election"];
+  return fmt::format("{} {}", fields.empty() ? form.description() : fmt::format("{}", fmt::join(fields, " ")),
+                     election.isNull() ? std::string("no election") : fmt::format("election {}", election));
 }
 
 void printForms(const tn::Value& forms) {
@@ -44,14 +46,15 @@ void printEntry(const tn::TNDaemonClient& client, const std::string& key, const 
   fmt::print("{}: {}\n", key, value);
 }
 
-void printReadable(const tn::TNDaemonClient& client, const tn::Dictionary& reply, bool succeeded) {
+void printReadable(const tn::TNDaemonClient& client, const tn::Dictionary& reply, bool succeeded,
+                   const std::string& emptySuccess) {
   bool printed = false;
   for (const auto& [key, value] : reply) {
     if (key == "errorcode" || key == "error") continue;
     printEntry(client, key, value);
     printed = true;
   }
-  if (!printed && succeeded) fmt::print("ok\n");
+  if (!printed && succeeded) fmt::print("{}\n", emptySuccess);
 }
 
 // The reply with `matches` decoded, for programs.
@@ -72,13 +75,14 @@ void printJson(const tn::TNDaemonClient& client, const tn::Dictionary& reply) {
 
 }  // namespace
 
-void printReply(const tn::TNDaemonClient& client, const tn::Value& reply, bool json, bool succeeded) {
+void printReply(const tn::TNDaemonClient& client, const tn::Value& reply, bool json, bool succeeded,
+                const std::string& emptySuccess) {
   static const tn::Dictionary kEmpty;
   const tn::Dictionary& dictionary = reply.dictionary() ? *reply.dictionary() : kEmpty;
   if (json) {
     printJson(client, dictionary);
   } else {
-    printReadable(client, dictionary, succeeded);
+    printReadable(client, dictionary, succeeded, emptySuccess);
   }
   std::fflush(stdout);
 }

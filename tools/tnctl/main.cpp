@@ -33,9 +33,11 @@ int main(int argc, char** argv) {
 
   tnctl::addDocumentCommand(app, options);
   tnctl::addRegistryCommands(app, options);
+  tnctl::addConsentCommands(app, options);
   tnctl::addLintCommand(app, options);
   tnctl::addRegistrationCommands(app, options);
   tnctl::addLookupCommands(app, options);
+  tnctl::addDiscoveryCommands(app, options);
   tnctl::addReadinessCommands(app, options);
   tnctl::addAnnotationCommands(app, options);
   tnctl::addHoldCommands(app, options);

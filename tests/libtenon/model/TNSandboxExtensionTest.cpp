@@ -6,6 +6,9 @@
 
 #include <gtest/gtest.h>
 
+#include <unistd.h>
+
+#include <cerrno>
 #include <cstdlib>
 
 #include "platform/sandbox/Extensions.h"
@@ -31,6 +34,48 @@ class SandboxExtensionTest : public test::ModelTest {
 
   test::TempDirectory root_;
 };
+
+// A manifest names resources relative to its bundle; nothing it names may
+// reach outside the bundle, lexically or through links.
+TEST_F(SandboxExtensionTest, BundleResourcesStayInsideTheBundle) {
+  const std::string bundle = root_ / "Plug.tnx";
+  test::makeDirectory(root_ / "Outside");
+  ASSERT_EQ(::symlink("/", (bundle + "/Root").c_str()), 0);
+  ASSERT_EQ(::symlink("../Outside", (bundle + "/Escape").c_str()), 0);
+  ASSERT_EQ(::symlink("Shared", (bundle + "/Alias").c_str()), 0);
+  ASSERT_EQ(::symlink(bundle.c_str(), (bundle + "/Self").c_str()), 0);
+  ASSERT_EQ(::symlink("Shared/../../Plug.tnx/Shared", (bundle + "/Roundabout").c_str()), 0);
+
+  // Inside: the bundle itself, plain names, links that stay in.
+  EXPECT_EQ(*bundleResourcePath(bundle, "."), bundle);
+  EXPECT_EQ(*bundleResourcePath(bundle + "/", "Shared"), bundle + "/Shared");
+  EXPECT_EQ(*bundleResourcePath(bundle, "./Shared/."), bundle + "/Shared");
+  EXPECT_EQ(*bundleResourcePath(bundle, "Alias"), bundle + "/Shared");
+  EXPECT_EQ(*bundleResourcePath(bundle, "Self"), bundle);
+  EXPECT_EQ(*bundleResourcePath(bundle, "Roundabout"), bundle + "/Shared");
+
+  // Refused (EPERM): by name alone, or by where links lead.
+  for (const std::string_view name :
+       {std::string_view("/etc/passwd"), std::string_view("../"), std::string_view(".."),
+        std::string_view("Shared/../../Outside"), std::string_view("Shared/.."), std::string_view(""),
+        std::string_view("Shared\0x", 8), std::string_view("Root"), std::string_view("Root/etc/passwd"),
+        std::string_view("Escape")}) {
+    const Result<std::string> path = bundleResourcePath(bundle, name);
+    ASSERT_FALSE(path) << name << " -> " << *path;
+    EXPECT_EQ(path.error().code(), EPERM) << name;
+  }
+  // Missing: not a refusal, just nothing there.
+  EXPECT_EQ(bundleResourcePath(bundle, "Absent").error().code(), ENOENT);
+
+  // The token names the checked canonical path.
+  const Result<std::string> token = issueBundleResourceExtension(URL::fileURLWithPath(bundle), "Alias");
+  ASSERT_TRUE(token) << token.error().description();
+  TNSandboxExtension holder(*token);
+  holder.consume();
+  ASSERT_TRUE(holder.isConsumed());
+  EXPECT_EQ(sandbox::heldExtension(holder.handle())->subject, bundle + "/Shared");
+  EXPECT_EQ(issueBundleResourceExtension(URL::fileURLWithPath(bundle), "Root").error().code(), EPERM);
+}
 
 TEST_F(SandboxExtensionTest, IssuesForCanonicalPathsAndServiceNames) {
   const URL indirect = URL::fileURLWithPath(root_ / "Plug.tnx/Shared/../Shared");

@@ -17,7 +17,7 @@
 namespace tn {
 namespace {
 
-const std::string kTnctl = std::string(TENON_BINARY_DIR) + "/tools/tnctl/tnctl";
+const std::string kTnctl = std::string(TENON_BINARY_DIR "/tools/tnctl/tnctl");
 
 class TnctlLintTest : public ::testing::Test {
  protected:

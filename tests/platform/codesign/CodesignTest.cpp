@@ -5,6 +5,7 @@
 
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -37,9 +38,24 @@ class Entitlements : public ::testing::Test {
     writeFile(tool_, "", 0755);
   }
 
-  TaskHandle handleFor(const std::string& executable) const {
-    return TaskHandle(ProcessIdentity{.pid = 42, .uid = 501, .gid = 20, .startTime = 7, .executablePath = executable},
-                      settings_);
+  static ProcessIdentity process(const std::string& executable) {
+    return ProcessIdentity{.pid = 42, .uid = 501, .gid = 20, .startTime = 7, .executablePath = executable,
+                           .executableFile = {}};
+  }
+
+  // The handle of a process that runs the file at `running` (opened as the
+  // daemon opens /proc/<pid>/exe) and whose path reads `executable`.
+  TaskHandle handleFor(const std::string& executable, const std::string& running = "") const {
+    const int fd = ::open((running.empty() ? executable : running).c_str(), O_PATH | O_CLOEXEC);
+    TaskHandle task(process(executable), fd, settings_);
+    if (fd >= 0) ::close(fd);
+    return task;
+  }
+
+  bool anyLineMentions(const std::string& text) const {
+    for (const std::string& line : capture_->lines())
+      if (line.find(text) != std::string::npos) return true;
+    return false;
   }
 
   // The entitlements document of the tool, written to entitlements.d/<name>.
@@ -175,17 +191,74 @@ TEST_F(Entitlements, UntrustedExecutableGetsNothing) {
   ASSERT_EQ(::chown(tool_.c_str(), kNobody, kNobody), 0);
   EXPECT_TRUE(entitlementValue(handleFor(tool_), "k")->isNull());
   EXPECT_TRUE(capture_->contains("ops", tn::log::Level::Error, "owned by uid 65534"));
+}
 
-  // A trusted document does not help an executable in a directory others
-  // may write to.
+// The executable is judged before anything its bundle holds is opened: an
+// untrusted program's bundle document (here a FIFO, which would be named
+// as "not a regular file" if it were looked at) is never touched, and
+// without a document of entitlements.d naming the program nothing is logged.
+TEST_F(Entitlements, AnUntrustedExecutablesBundleIsNeverRead) {
   makeDirectory(root_ / "open", 0777);
   makeBundle(root_ / "open/App", R"({"BNBundleExecutable": "app"})", "app");
-  writeFile(root_ / "open/App/Entitlements.manifest", R"({"k": true})");
-  capture_->clear();
-  EXPECT_TRUE(entitlementValue(handleFor(root_ / "open/App/bin/app"), "k")->isNull());
-  EXPECT_TRUE(capture_->contains("ops", tn::log::Level::Error,
-                                 "ignoring entitlements of executable " + root_ / "open/App/bin/app"));
-  EXPECT_TRUE(capture_->contains("ops", tn::log::Level::Error, "not sticky"));
+  const std::string document = root_ / "open/App/Entitlements.manifest";
+  ASSERT_EQ(::mkfifo(document.c_str(), 0644), 0);
+  const std::size_t parses = DocumentCache::shared().parseCount();
+  EXPECT_TRUE(handleFor(root_ / "open/App/bin/app").entitlements().dictionary()->empty());
+  EXPECT_FALSE(anyLineMentions(document));
+  EXPECT_TRUE(capture_->lines().empty());
+  EXPECT_EQ(DocumentCache::shared().parseCount(), parses);
+
+  // The same FIFO beside a trusted executable is looked at, and refused.
+  makeBundle(root_ / "Safe", R"({"BNBundleExecutable": "app"})", "app");
+  ASSERT_EQ(::mkfifo((root_ / "Safe/Entitlements.manifest").c_str(), 0644), 0);
+  EXPECT_TRUE(handleFor(root_ / "Safe/bin/app").entitlements().dictionary()->empty());
+  EXPECT_TRUE(ignoredWithReason(root_ / "Safe/Entitlements.manifest", "not a regular file"));
+}
+
+// Documents grant the file, not the name: a process running another file
+// whose path reads the same (a copy mounted over the path in its own mount
+// namespace) gets nothing, even when that file would pass the trust rule.
+TEST_F(Entitlements, EntitlementsBelongToTheFileNotToItsPath) {
+  writeToolDocument("tool.manifest", R"({"k": true})");
+  const std::string copy = root_ / "bin/copy";
+  writeFile(copy, "", 0755);
+  EXPECT_TRUE(handleFor(tool_, copy).entitlements().dictionary()->empty());
+  EXPECT_EQ(*entitlementValue(handleFor(tool_), "k"), tn::Value(true));
+
+  writeFile(app_ + "/Entitlements.manifest", R"({"b": true})");
+  const std::string otherApp = root_ / "bin/other-app";
+  writeFile(otherApp, "", 0755);
+  EXPECT_TRUE(handleFor(app_ + "/bin/app", otherApp).entitlements().dictionary()->empty());
+  EXPECT_TRUE(ignoredWithReason(app_ + "/Entitlements.manifest", "is not the file the process runs"));
+  EXPECT_EQ(*entitlementValue(handleFor(app_ + "/bin/app"), "b"), tn::Value(true));
+}
+
+TEST_F(Entitlements, AFinalLinkInTheNamedExecutableIsFollowed) {
+  const std::string link = root_ / "bin/tool-link";
+  ASSERT_EQ(::symlink(tool_.c_str(), link.c_str()), 0);
+  writeFile(settings_.entitlementsDirectory + "/tool.manifest",
+            R"({"executable": ")" + link + R"(", "entitlements": {"k": 1}})");
+  EXPECT_EQ(*entitlementValue(handleFor(tool_), "k"), tn::Value(1));
+}
+
+TEST_F(Entitlements, AProcessWhoseExecutableCannotBeOpenedHasNoEntitlements) {
+  writeToolDocument("tool.manifest", R"({"k": true})");
+  const TaskHandle task(process(tool_), -1, settings_);
+  EXPECT_TRUE(task.entitlements().dictionary()->empty());
+  EXPECT_FALSE(task.identity().executableFile.has_value());
+  const tn::Result<tn::Value> value = entitlementValue(task, "k");
+  ASSERT_FALSE(value);
+  EXPECT_EQ(value.error().code(), static_cast<int64_t>(CodesignErrorCode::NoExecutable));
+}
+
+// An untrusted document is not parsed, and is named whatever it names.
+TEST_F(Entitlements, AnUntrustedDocumentIsNeverParsed) {
+  const std::string path = settings_.entitlementsDirectory + "/other.manifest";
+  writeFile(path, R"({"executable": "/usr/bin/other", "entitlements": {"k": true}})", 0666);
+  const std::size_t parses = DocumentCache::shared().parseCount();
+  EXPECT_TRUE(handleFor(tool_).entitlements().dictionary()->empty());
+  EXPECT_EQ(DocumentCache::shared().parseCount(), parses);
+  EXPECT_TRUE(ignoredWithReason(path, "writable by group or others (mode 0666)"));
 }
 
 TEST_F(Entitlements, MalformedDocumentsAreIgnoredAndNamed) {
@@ -208,7 +281,7 @@ TEST_F(Entitlements, MalformedDocumentsAreIgnoredAndNamed) {
 }
 
 TEST_F(Entitlements, UnknownExecutableIsAnError) {
-  const TaskHandle task(ProcessIdentity{.pid = 9, .uid = 0, .gid = 0, .startTime = 0, .executablePath = ""}, settings_);
+  const TaskHandle task(process(""), -1, settings_);
   const tn::Result<tn::Value> value = entitlementValue(task, "k");
   ASSERT_FALSE(value);
   EXPECT_EQ(value.error().domain(), kCodesignErrorDomain);

@@ -58,6 +58,24 @@ TEST_F(SerialQueueDeathTest, SyncBackOntoAnOuterQueueOfANestedSyncAborts) {
       "tenon: fatal: sync onto queue 'A' from a block running on it would deadlock");
 }
 
+TEST_F(SerialQueueDeathTest, ASyncAgainstTheLockOrderAbortsOnFirstUseNamingBothQueues) {
+  if (!SerialQueue::checksLockOrder()) GTEST_SKIP() << "this build does not check the lock order";
+  const auto service = SerialQueue::create("service");
+  service->setLockRank(10);
+  const auto leaf = SerialQueue::create("leaf");
+  leaf->setLockRank(20);
+  const auto otherLeaf = SerialQueue::create("other-leaf");
+  otherLeaf->setLockRank(20);
+  const auto unranked = SerialQueue::create("unranked");
+  // In order, and through unranked queues, all is well.
+  service->sync([&] { leaf->sync([] {}); });
+  unranked->sync([&] { leaf->sync([&] { unranked->async([] {}); }); });
+  EXPECT_DEATH(leaf->sync([&] { service->sync([] {}); }),
+               "tenon: fatal: lock order: sync onto queue 'service' \\(rank 10\\) from a thread holding "
+               "queue 'leaf' \\(rank 20\\)");
+  EXPECT_DEATH(leaf->sync([&] { otherLeaf->sync([] {}); }), "lock order: sync onto queue 'other-leaf'");
+}
+
 TEST_F(SerialQueueDeathTest, AssertOnQueueOffAnyQueueAborts) {
   EXPECT_DEATH(SerialQueue::create("TNDatabase")->assertOnQueue(),
                "tenon: fatal: assertion failed: not running on queue 'TNDatabase' "

@@ -2,7 +2,12 @@
 
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
+#include <poll.h>
+#include <unistd.h>
+
 #include <atomic>
+#include <chrono>
 #include <cstdlib>
 #include <cstddef>
 #include <memory>
@@ -189,6 +194,130 @@ TEST(ThreadPool, SharedPoolHasAtLeastTwoBaseWorkersAndRoomToGrow) {
   EXPECT_GE(pool.baseThreadCount(), 2u);
   EXPECT_GE(pool.baseThreadCount(), std::thread::hardware_concurrency());
   EXPECT_GE(pool.maxThreadCount(), 64u);
+}
+
+}  // namespace
+}  // namespace tn::dispatch
+
+namespace tn::dispatch {
+namespace {
+
+// An event source for the pool's idle workers to wait in: events are bytes
+// written to a pipe; each runs `onEvent` on the thread that waited.
+class PipePoller final : public Poller {
+ public:
+  PipePoller() {
+    if (::pipe2(events_, O_CLOEXEC) != 0 || ::pipe2(wakeups_, O_CLOEXEC | O_NONBLOCK) != 0) std::abort();
+  }
+  ~PipePoller() override {
+    for (int fd : {events_[0], events_[1], wakeups_[0], wakeups_[1]}) ::close(fd);
+  }
+  void post() {
+    const char byte = 1;
+    if (::write(events_[1], &byte, 1) != 1) std::abort();
+  }
+  void pollOnce() override {
+    pollfd fds[2] = {{events_[0], POLLIN, 0}, {wakeups_[0], POLLIN, 0}};
+    if (::poll(fds, 2, -1) <= 0) return;
+    if (fds[1].revents != 0) {
+      char drain[64];
+      while (::read(wakeups_[0], drain, sizeof drain) > 0) {
+      }
+      return;
+    }
+    char byte;
+    if (::read(events_[0], &byte, 1) == 1) onEvent();
+  }
+  void interrupt() override {
+    const char byte = 1;
+    (void)!::write(wakeups_[1], &byte, 1);
+  }
+  std::function<void()> onEvent;
+
+ private:
+  int events_[2];
+  int wakeups_[2];
+};
+
+TEST(ThreadPoolPoller, TheWorkerAnEventWokeRunsTheWorkItQueued) {
+  // The poller and everything the tasks use outlive the pool.
+  PipePoller poller;
+  Counter done;
+  std::atomic<std::thread::id> eventThread, firstHop, secondHop;
+  ThreadPool pool(2, 4);
+  poller.onEvent = [&] {
+    eventThread = std::this_thread::get_id();
+    pool.submit([&] {
+      firstHop = std::this_thread::get_id();
+      pool.submit([&] {  // a chain of hand-offs, as between serial queues
+        secondHop = std::this_thread::get_id();
+        done.increment();
+      });
+    });
+  };
+  pool.setPoller(&poller);
+  EXPECT_EQ(pool.counts().threads, 1u) << "one worker waits for events; none is needed for tasks yet";
+  int sameThread = 0;
+  constexpr int kEvents = 50;
+  for (int i = 1; i <= kEvents; ++i) {
+    poller.post();
+    done.waitFor(static_cast<std::size_t>(i));
+    if (eventThread.load() == firstHop.load() && firstHop.load() == secondHop.load()) ++sameThread;
+  }
+  // The pool grows to its base once; after that each event's work stays on
+  // the thread the event woke.
+  EXPECT_GE(sameThread, kEvents - 2);
+  EXPECT_LE(pool.counts().threads, 2u);
+}
+
+TEST(ThreadPoolPoller, AWorkerThatBlocksLeavesTheWaitingForEventsToAnother) {
+  PipePoller poller;
+  Gate release;
+  Counter events;
+  std::atomic<bool> first{true};
+  ThreadPool pool(2, 4);
+  poller.onEvent = [&] {
+    events.increment();
+    if (!first.exchange(false)) return;
+    pool.submit([&] {
+      const ThreadPool::BlockingScope blocking;
+      release.wait();  // holds this worker until the second event came
+    });
+  };
+  pool.setPoller(&poller);
+  poller.post();
+  events.waitFor(1);
+  poller.post();
+  events.waitFor(2);  // hangs if nobody waits for events while a worker blocks
+  release.open();
+}
+
+TEST(ThreadPoolPoller, WorkSubmittedFromOutsideReachesAWorkerWaitingInThePoller) {
+  PipePoller poller;
+  Counter done;
+  ThreadPool pool(1, 1);
+  pool.setPoller(&poller);
+  for (int i = 1; i <= 20; ++i) {
+    pool.submit([&] { done.increment(); });  // the only worker sits in pollOnce()
+    done.waitFor(static_cast<std::size_t>(i));
+  }
+}
+
+TEST(ThreadPoolDeathTest, APoolAtItsCapWhoseWorkersAllWaitSaysWhatTheyWaitFor) {
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  EXPECT_DEATH(
+      {
+        ThreadPool pool(1, 1, std::chrono::milliseconds(100));
+        Gate never;
+        pool.submit([&] {
+          const ThreadPool::BlockingScope blocking("the gate of the test");
+          never.wait();
+        });
+        pool.submit([] {});  // can never run
+        std::this_thread::sleep_for(std::chrono::seconds(10));
+        std::exit(0);
+      },
+      "thread pool stalled: all 1 workers.*\\[the gate of the test\\]");
 }
 
 }  // namespace

@@ -3,17 +3,23 @@
 
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <chrono>
 #include <condition_variable>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <future>
 #include <mutex>
 #include <sstream>
+#include <thread>
+#include <vector>
 
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/notify/Notify.h"
@@ -102,7 +108,33 @@ TEST_F(Notify, PostsAreCounted) {
   std::ifstream file(fileOf(kName));
   std::stringstream contents;
   contents << file.rdbuf();
-  EXPECT_EQ(contents.str(), "2\n");
+  EXPECT_EQ(contents.str(), "00000000000000000002\n");  // one fixed-width record
+}
+
+TEST_F(Notify, OlderAndLongerTextsReadUpToTheirFirstLine) {
+  ASSERT_TRUE(post(kName));
+  std::ofstream(fileOf(kName), std::ofstream::trunc) << "41\n";  // the earlier format
+  EXPECT_EQ(*postCount(kName), 41U);
+  EXPECT_EQ(*post(kName), 42U);
+  std::ofstream(fileOf(kName), std::ofstream::trunc) << "7\n" << std::string(100, 'x');
+  EXPECT_EQ(*postCount(kName), 7U);
+  EXPECT_EQ(*post(kName), 8U);
+  EXPECT_EQ(std::filesystem::file_size(fileOf(kName)), 21U) << "cut back to one record";
+}
+
+// flock needs only read access, which every user has: a peer holding an
+// exclusive lock on the file must not stall posts or reads.
+TEST_F(Notify, AnotherDescriptionsLockDoesNotStallPostsOrReads) {
+  ASSERT_TRUE(post(kName));
+  const int peer = ::open(fileOf(kName).c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(peer, 0);
+  ASSERT_EQ(::flock(peer, LOCK_EX), 0);
+  auto posted = std::async(std::launch::async, [] { return post(kName).ok() && postCount(kName).ok(); });
+  const bool finished = posted.wait_for(std::chrono::seconds(30)) == std::future_status::ready;
+  ::close(peer);  // lets a stalled post finish, so the test ends either way
+  EXPECT_TRUE(finished) << "post waited on a lock a peer held";
+  EXPECT_TRUE(posted.get());
+  EXPECT_EQ(*postCount(kName), 2U);
 }
 
 TEST_F(Notify, FilesAndDirectoriesGetTheirModesWhateverTheUmask) {
@@ -128,6 +160,25 @@ TEST_F(Notify, FileWithoutACounterStartsOver) {
   EXPECT_EQ(*postCount(kName), 0U);
 }
 
+TEST_F(Notify, ConcurrentPostsFromManyThreadsEachCountOnce) {
+  constexpr int kThreads = 4;
+  constexpr int kPostsEach = 200;
+  std::vector<std::thread> threads;
+  std::atomic<int> failures{0};
+  for (int i = 0; i < kThreads; ++i) {
+    threads.emplace_back([&] {
+      for (int j = 0; j < kPostsEach; ++j) {
+        if (!post(kName)) ++failures;
+      }
+    });
+  }
+  for (std::thread& thread : threads) thread.join();
+  EXPECT_EQ(failures.load(), 0);
+  EXPECT_EQ(*postCount(kName), static_cast<uint64_t>(kThreads * kPostsEach));
+}
+
+// The poster's processes serialise on a lock file of their own (mode 0600),
+// so posts from several processes at once each count exactly once too.
 TEST_F(Notify, ConcurrentPostsFromManyProcessesEachCountOnce) {
   constexpr int kProcesses = 4;
   constexpr int kPostsEach = 50;
@@ -148,6 +199,26 @@ TEST_F(Notify, ConcurrentPostsFromManyProcessesEachCountOnce) {
     EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
   }
   EXPECT_EQ(*postCount(kName), static_cast<uint64_t>(kProcesses * kPostsEach));
+  struct stat status {};
+  ASSERT_EQ(::stat((root_ + "/run/tenon/notify/." + std::string(kName) + ".lock").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 07777, 0600U) << "nobody else can open the lock file";
+}
+
+// A lock file another user could open is not used: a peer holding it does
+// not stall the post.
+TEST_F(Notify, ALockFileOthersCanOpenIsIgnored) {
+  ASSERT_TRUE(post(kName));
+  const std::string lockFile = root_ + "/run/tenon/notify/." + std::string(kName) + ".lock";
+  ASSERT_EQ(::chmod(lockFile.c_str(), 0644), 0);
+  const int peer = ::open(lockFile.c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(peer, 0);
+  ASSERT_EQ(::flock(peer, LOCK_EX), 0);
+  auto posted = std::async(std::launch::async, [] { return post(kName).ok(); });
+  const bool finished = posted.wait_for(std::chrono::seconds(30)) == std::future_status::ready;
+  ::close(peer);
+  EXPECT_TRUE(finished) << "post waited on a lock file others can open";
+  EXPECT_TRUE(posted.get());
+  EXPECT_EQ(*postCount(kName), 2U);
 }
 
 TEST_F(Notify, InvalidNamesAreRefused) {

@@ -4,6 +4,8 @@
 
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -44,6 +46,37 @@ TEST_F(Preferences, AMissingDomainIsEmptyAndWritesAreSeenByTheNextRead) {
 
   ASSERT_TRUE(writer.setValue("exclusions", std::nullopt).ok());
   EXPECT_FALSE(*reader.value("exclusions"));
+}
+
+TEST_F(Preferences, TemporariesOfKilledWritersAreRemovedAndLiveOnesKept) {
+  const PreferenceDomain domain("com.ostrel.tenon.userprefs", 503);
+  ASSERT_TRUE(domain.setValue("a", Value(1)).ok());
+  const std::filesystem::path directory = std::filesystem::path(domain.path()).parent_path();
+  const auto temporary = [&](const std::string& random) {
+    const std::filesystem::path path = directory / (".com.ostrel.tenon.userprefs.manifest.tenon-tmp." + random);
+    std::ofstream(path) << "<half";
+    return path;
+  };
+  const std::filesystem::path dead = temporary("DEAD01");
+  const std::filesystem::path live = temporary("LIVE01");
+  const int liveFd = ::open(live.c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(liveFd, 0);
+  ASSERT_EQ(::flock(liveFd, LOCK_EX), 0);
+
+  ASSERT_TRUE(domain.setValue("b", Value(2)).ok());
+  EXPECT_FALSE(std::filesystem::exists(dead)) << "a writer cleans its directory";
+  EXPECT_TRUE(std::filesystem::exists(live)) << "a live writer's file stays";
+  ::close(liveFd);
+  EXPECT_EQ(**domain.value("a"), Value(1));
+
+  // A reader cleans a directory the first time this process reads there.
+  const PreferenceDomain unread("com.ostrel.tenon.userprefs", 504);
+  const std::filesystem::path other = std::filesystem::path(unread.path()).parent_path();
+  std::filesystem::create_directories(other);
+  const std::filesystem::path deadThere = other / ".x.manifest.tenon-tmp.DEAD02";
+  std::ofstream(deadThere) << "<half";
+  EXPECT_FALSE(*unread.value("b"));
+  EXPECT_FALSE(std::filesystem::exists(deadThere));
 }
 
 TEST_F(Preferences, WritersInOtherProcessesKeepEachOthersKeys) {

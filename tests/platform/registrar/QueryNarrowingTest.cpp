@@ -27,7 +27,7 @@ TEST(QueryNarrowing, EqualityKeysIgnoreLeadingZerosOnly) {
   EXPECT_EQ(equalityOperand(tn::Value("=")), "");
   EXPECT_FALSE(equalityOperand(tn::Value("<>x")));
   EXPECT_FALSE(equalityOperand(tn::Value(">=1")));
-  EXPECT_FALSE(equalityOperand(tn::Value("?TY-IS:public.data")));
+  EXPECT_FALSE(equalityOperand(tn::Value("?TY-IS:application/octet-stream")));
 }
 
 TEST(QueryNarrowing, UnderstoodEntriesNarrowExactly) {

@@ -140,6 +140,13 @@ TEST(RegistrarChanges, PlugInsOutsideApplicationsAreRegisteredByURL) {
   EXPECT_NE(bad.error().message()->find(root.path() + "/Bad: Info.manifest has no \"XTExtension\""),
             std::string::npos);
 
+  // A path with a NUL names nothing, even when the part before it is a plug-in.
+  const tn::URL withNul = tn::URL::fileURLWithPath(loose + std::string("\0/x", 3));
+  EXPECT_FALSE(registrar->plugInForURL(withNul));
+  EXPECT_EQ(registrar->registerPlugIn(withNul).error().code(), static_cast<int64_t>(RegistrarErrorCode::NotFound));
+  EXPECT_EQ(registrar->unregisterPlugIn(withNul).error().code(), static_cast<int64_t>(RegistrarErrorCode::NotFound));
+  EXPECT_TRUE(registrar->plugInForURL(tn::URL::fileURLWithPath(loose))) << "still registered";
+
   ASSERT_TRUE(registrar->unregisterPlugIn(tn::URL::fileURLWithPath(loose)).ok());
   EXPECT_FALSE(registrar->plugInForURL(tn::URL::fileURLWithPath(loose)));
   EXPECT_FALSE(registrar->unregisterPlugIn(tn::URL::fileURLWithPath(loose)).ok());

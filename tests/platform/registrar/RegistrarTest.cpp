@@ -7,8 +7,10 @@
 #include <unistd.h>
 
 #include <filesystem>
+#include <fstream>
 
 #include "platform/log/Log.h"
+#include "platform/registrar/Store.h"
 #include "tests/platform/registrar/RegistrarTestSupport.h"
 
 namespace registrar::test {
@@ -313,6 +315,69 @@ TEST(RegistrarStore, AnotherApplicationsDatabaseIsForeign) {
   ASSERT_TRUE(registrar);
   EXPECT_TRUE(capture->contains("rg", tn::log::Level::Error, "not a registrar store (application id 7)"));
   EXPECT_TRUE(registrar->applicationForURL(tn::URL::fileURLWithPath(root.appRoot() + "/App")));
+}
+
+StoredPlugIn storedPlugIn(int n, tn::Value info) {
+  StoredPlugIn plugIn;
+  plugIn.uuid = tn::UUID::random();
+  plugIn.path = fmt::format("/opt/P{}.tnx", n);
+  plugIn.identifier = fmt::format("com.example.p{}", n);
+  plugIn.info = std::move(info);
+  plugIn.registered = tn::Date{1.5};
+  return plugIn;
+}
+
+// Binds use the 64-bit sizes and are checked: a value the store refuses
+// fails the whole write with SQLite's reason, and nothing of it is kept.
+TEST(RegistrarStore, AValueTheStoreRefusesFailsTheWholeWrite) {
+  PlatformRoot root;
+  auto opened = Store::open(root.path() + "/store.sqlite3", Store::Mode::ReadWrite);
+  ASSERT_TRUE(opened.ok()) << opened.error().description();
+  Store& store = *opened->store;
+  store.limitValueSize(4096);
+  Store::Changes changes;
+  changes.newKnowledge = tn::UUID::random();
+  changes.putPlugIns = {storedPlugIn(1, tn::Value("small")), storedPlugIn(2, tn::Value(std::string(10000, 'x')))};
+  const tn::Result<void> applied = store.apply(changes);
+  ASSERT_FALSE(applied.ok());
+  EXPECT_EQ(applied.error().code(), static_cast<int64_t>(RegistrarErrorCode::Store));
+  EXPECT_NE(applied.error().message()->find("cannot store plug-in /opt/P2.tnx"), std::string::npos)
+      << applied.error().description();
+  const auto contents = store.load();
+  ASSERT_TRUE(contents.ok());
+  EXPECT_TRUE(contents->plugIns.empty()) << "the first plug-in was rolled back too";
+  EXPECT_TRUE(contents->knowledge.isNil());
+
+  changes.putPlugIns.pop_back();
+  ASSERT_TRUE(store.apply(changes).ok());
+  EXPECT_EQ(store.load()->plugIns.size(), 1u);
+}
+
+// A read that fails part-way (a damaged page) is an error, never a store
+// with fewer records.
+TEST(RegistrarStore, AReadThatFailsPartWayIsAnError) {
+  PlatformRoot root;
+  const std::string path = root.path() + "/store.sqlite3";
+  {
+    auto opened = Store::open(path, Store::Mode::ReadWrite);
+    ASSERT_TRUE(opened.ok());
+    Store::Changes changes;
+    changes.newKnowledge = tn::UUID::random();
+    for (int i = 0; i < 2000; ++i) changes.putPlugIns.push_back(storedPlugIn(i, tn::Value(std::string(200, 'i'))));
+    ASSERT_TRUE(opened->store->apply(changes).ok());
+  }
+  // Damage the pages in the second half of the file (the last plug-ins' leaves).
+  const auto size = std::filesystem::file_size(path);
+  ASSERT_GT(size, 200000u);
+  {
+    std::fstream file(path, std::ios::in | std::ios::out | std::ios::binary);
+    for (std::uintmax_t page = size / 2 / 4096; page < size / 4096 - 1; page += 3) {
+      file.seekp(static_cast<std::streamoff>(page * 4096));
+      file.write(std::string(4096, '\xee').data(), 4096);
+    }
+  }
+  const auto reopened = Store::open(path, Store::Mode::ReadOnly);
+  EXPECT_FALSE(reopened.ok()) << reopened->contents.plugIns.size() << " plug-ins read";
 }
 
 }  // namespace

@@ -3,7 +3,9 @@
 #include <gtest/gtest.h>
 
 #include <array>
+#include <chrono>
 #include <string>
+#include <vector>
 
 #include "platform/relay/ConnectionLimit.h"
 #include "platform/relay/InboundBudget.h"
@@ -54,13 +56,42 @@ TEST(InboundBudget, PausesAtALimitAndExactlyOneReleaseResumesAtHalf) {
 }
 
 TEST(ConnectionLimit, CountsLeasesPerUserUntilTheyAreGiven) {
-  const auto limit = std::make_shared<ConnectionLimit>(1);
+  const auto limit = std::make_shared<ConnectionLimit>(ConnectionLimits{1});
   auto lease = limit->acquire(1000);
   ASSERT_TRUE(lease);
-  EXPECT_FALSE(limit->acquire(1000));
+  ConnectionLimit::Refusal why = ConnectionLimit::Refusal::None;
+  EXPECT_FALSE(limit->acquire(1000, &why));
+  EXPECT_EQ(why, ConnectionLimit::Refusal::PerUser);
   EXPECT_TRUE(limit->acquire(1001));
   lease.reset();
   EXPECT_TRUE(limit->acquire(1000));
+  EXPECT_EQ(limit->count(1000), 0u) << "a refused user leaves no entry behind";
+}
+
+TEST(ConnectionLimit, KeepsTheLastPlacesOfTheTotalForRoot) {
+  const auto limit = std::make_shared<ConnectionLimit>(ConnectionLimits{10, 4, 1});
+  std::vector<std::shared_ptr<void>> leases;
+  for (uid_t uid = 2000; uid < 2003; ++uid) leases.push_back(limit->acquire(uid));
+  for (const auto& lease : leases) ASSERT_TRUE(lease);
+  ConnectionLimit::Refusal why = ConnectionLimit::Refusal::None;
+  EXPECT_FALSE(limit->acquire(2003, &why)) << "the fourth place is root's";
+  EXPECT_EQ(why, ConnectionLimit::Refusal::Total);
+  auto rootLease = limit->acquire(0);
+  ASSERT_TRUE(rootLease);
+  EXPECT_FALSE(limit->acquire(0)) << "and then the total is reached for everybody";
+  EXPECT_EQ(limit->total(), 4u);
+  leases.clear();
+  EXPECT_EQ(limit->total(), 1u);
+  EXPECT_TRUE(limit->acquire(2003));
+}
+
+TEST(ConnectionLimit, NamesARefusedUserAtMostOnceAMinute) {
+  const auto limit = std::make_shared<ConnectionLimit>(ConnectionLimits{});
+  const auto start = std::chrono::steady_clock::now();
+  EXPECT_TRUE(limit->refusalWorthLogging(65534, start));
+  EXPECT_FALSE(limit->refusalWorthLogging(65534, start + std::chrono::seconds(59)));
+  EXPECT_TRUE(limit->refusalWorthLogging(1000, start + std::chrono::seconds(59))) << "another user is named";
+  EXPECT_TRUE(limit->refusalWorthLogging(65534, start + std::chrono::seconds(61)));
 }
 
 }  // namespace

@@ -51,7 +51,7 @@ Server::Server(std::string serviceName, Responder respond) : respond_(std::move(
   listener_->setNewConnectionHandler([this](std::shared_ptr<Connection> connection) {
     auto events = std::make_shared<EventRecorder>();
     connection->setEventHandler([this, events, weak = std::weak_ptr(connection)](const Event& event) {
-      events->add(event);
+      events->record(event);
       const auto self = weak.lock();
       if (event.kind != Event::Kind::Message || !self || !respond_) return;
       if (tn::Value reply = respond_(event.message); !reply.isNull()) self->sendReply(event.message, reply);

@@ -71,10 +71,16 @@ class Recorder {
 };
 
 // A connection's events: connection->setEventHandler(recorder.handler()).
+// What is recorded is for looking at, so it does not keep the requests'
+// share of the connection's inbound budget (Message::charge).
 class EventRecorder : public Recorder<Event> {
  public:
   Connection::EventHandler handler() {
-    return [this](const Event& event) { add(event); };
+    return [this](const Event& event) { record(event); };
+  }
+  void record(Event event) {
+    event.message.charge.reset();
+    add(std::move(event));
   }
   std::vector<Event::Kind> kinds() const;
   int count(Event::Kind kind) const;

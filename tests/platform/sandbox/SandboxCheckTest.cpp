@@ -3,29 +3,18 @@
 
 #include <gtest/gtest.h>
 
-#include <linux/filter.h>
-#include <linux/seccomp.h>
-#include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cstddef>
 
 #include "platform/sandbox/SandboxCheck.h"
+#include "tests/support/SeccompFilter.h"
 
 namespace sandbox {
 namespace {
 
-// Installs a filter that allows every system call. Async-signal-safe, for a
-// forked child.
-bool installAllowAllFilter() {
-  sock_filter allowAll[] = {BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW)};
-  sock_fprog program{};
-  program.len = 1;
-  program.filter = allowAll;
-  return ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
-         ::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program, 0, 0) == 0;
-}
+using tn::test::installAllowAllFilter;
 
 // A child process that (optionally) installs a filter, reports that it is
 // ready, and lives until the object is destroyed.
@@ -123,6 +112,19 @@ TEST(SandboxCheckParsing, StartTimeSurvivesHostileCommandNames) {
   EXPECT_EQ(parseStartTime("17 (x) S 1 2 3"), std::nullopt);
   EXPECT_EQ(parseStartTime("17 sh S 1 2"), std::nullopt);
   EXPECT_EQ(parseStartTime("17 (x) S 1 2 3 4 5 6 7 8 9 10 11 12 13 14 15 16 17 18 12a 19"), std::nullopt);
+}
+
+// The connection path fails closed: a count that could not be read is a
+// sandboxed peer; only a count above our own is, otherwise.
+TEST(CountsAsSandboxed, AnUnreadableCountIsSandboxed) {
+  const std::optional<uint64_t> ours = seccompFilterCount(::getpid());
+  ASSERT_TRUE(ours.has_value());
+  EXPECT_TRUE(countsAsSandboxed(std::nullopt));
+  EXPECT_FALSE(countsAsSandboxed(*ours));
+  EXPECT_TRUE(countsAsSandboxed(*ours + 1));
+  if (*ours > 0) {
+    EXPECT_FALSE(countsAsSandboxed(*ours - 1));
+  }
 }
 
 }  // namespace

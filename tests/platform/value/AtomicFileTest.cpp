@@ -5,15 +5,18 @@
 
 #include <fcntl.h>
 #include <signal.h>
+#include <sys/file.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
+#include <thread>
 
 #include "platform/value/AtomicFile.h"
 
@@ -172,6 +175,103 @@ TEST_F(AtomicFile, ASymbolicLinkIsReplacedNotFollowed) {
   EXPECT_FALSE(fs::is_symlink(target_));
   EXPECT_EQ(contentsOf(target_), "new");
   EXPECT_EQ(contentsOf(elsewhere), "untouched");
+}
+
+
+// What a writer killed during a save leaves: its temporary file, unlocked.
+fs::path leaveTemporary(const fs::path& dir, const std::string& name, const std::string& random) {
+  const fs::path path = dir / ("." + name + std::string(kTemporaryMarker) + random);
+  std::ofstream(path) << "half a document";
+  return path;
+}
+
+TEST_F(AtomicFile, StaleTemporariesAreRemovedAndEverythingElseIsKept) {
+  ASSERT_TRUE(writeFileAtomically(target_, "the file"));
+  leaveTemporary(dir_, "annotations", "Ab12Zz");
+  leaveTemporary(dir_, "other.manifest", "q9W8e7");
+  // A live writer: its temporary is locked (by another open file description).
+  const fs::path live = leaveTemporary(dir_, "annotations", "LIVE00");
+  const int liveFd = ::open(live.c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(liveFd, 0);
+  ASSERT_EQ(::flock(liveFd, LOCK_EX), 0);
+  // Not ours: other names, a link named like a temporary, a directory.
+  std::ofstream(dir_ / ".annotations.tmp-ABCDEF") << "someone else's";
+  std::ofstream(dir_ / ".annotations.tenon-tmp.short") << "not six random characters";
+  std::ofstream(dir_ / "elsewhere") << "untouched";
+  fs::create_symlink(dir_ / "elsewhere", dir_ / ".link.tenon-tmp.AAAAAA");
+  fs::create_directory(dir_ / ".dir.tenon-tmp.BBBBBB");
+
+  const Result<size_t> removed = removeStaleTemporaryFiles(dir_);
+  ::close(liveFd);
+  ASSERT_TRUE(removed) << removed.error().description();
+  EXPECT_EQ(*removed, 2u);
+  expectDirectoryHolds({"annotations", ".annotations.tenon-tmp.LIVE00", ".annotations.tmp-ABCDEF",
+                        ".annotations.tenon-tmp.short", "elsewhere", ".link.tenon-tmp.AAAAAA",
+                        ".dir.tenon-tmp.BBBBBB"});
+  EXPECT_EQ(contentsOf(target_), "the file");
+  EXPECT_EQ(contentsOf(dir_ / "elsewhere"), "untouched");
+
+  EXPECT_EQ(removeStaleTemporaryFiles(dir_ / "absent").error().code(), ENOENT);
+}
+
+// Writers killed at any instant leave temporaries; cleaning removes them
+// all, and the file is always one whole version.
+TEST_F(AtomicFile, CleaningAfterKilledWritersLeavesNoTemporaryAndAWholeFile) {
+  const std::string big(256 * 1024, 'x');
+  ASSERT_TRUE(writeFileAtomically(target_, "v0" + big));
+  for (int round = 0; round < 20; ++round) {
+    const pid_t child = ::fork();
+    if (child == 0) {
+      for (int i = 0;; ++i) (void)writeFileAtomically(target_, "v" + std::to_string(i) + big);
+    }
+    // Kill it while it writes: wait until one of its temporaries is there.
+    for (int i = 0; i < 100000; ++i) {
+      bool seen = false;
+      for (const auto& entry : fs::directory_iterator(dir_))
+        seen = seen || entry.path().filename().string().find(kTemporaryMarker) != std::string::npos;
+      if (seen) break;
+    }
+    ::kill(child, SIGKILL);
+    int status = 0;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+  }
+  ASSERT_TRUE(removeStaleTemporaryFiles(dir_));
+  expectDirectoryHolds({"annotations"});
+  const std::string contents = contentsOf(target_);
+  ASSERT_EQ(contents.size() - contents.find('x'), big.size());
+  EXPECT_EQ(contents.front(), 'v');
+}
+
+// A cleaner running while this process writes never removes the writer's
+// file from under it: every save succeeds.
+TEST_F(AtomicFile, ConcurrentCleaningNeverBreaksASave) {
+  std::atomic<bool> stop{false};
+  std::thread cleaner([&] {
+    while (!stop.load()) (void)removeStaleTemporaryFiles(dir_);
+  });
+  int failures = 0;
+  for (int i = 0; i < 300; ++i) failures += writeFileAtomically(target_, std::to_string(i)).ok() ? 0 : 1;
+  stop.store(true);
+  cleaner.join();
+  EXPECT_EQ(failures, 0);
+  EXPECT_EQ(contentsOf(target_), "299");
+  expectDirectoryHolds({"annotations"});
+}
+
+}  // namespace
+}  // namespace tn
+
+namespace tn {
+namespace {
+
+TEST_F(AtomicFile, CreatingOnlyCreatesOnceNeverReplacesAndLeavesNoTemporary) {
+  ASSERT_TRUE(createFileAtomically(target_.string(), "first", 0600));
+  const Result<void> again = createFileAtomically(target_.string(), "second", 0600);
+  ASSERT_FALSE(again);
+  EXPECT_EQ(again.error().code(), EEXIST);
+  EXPECT_EQ(contentsOf(target_), "first");
+  EXPECT_EQ(modeOf(target_), 0600u);
+  EXPECT_EQ(std::distance(fs::directory_iterator(dir_), fs::directory_iterator()), 1);
 }
 
 }  // namespace

@@ -112,7 +112,7 @@ TEST_F(DocumentFile, AnOversizedFileIsRefusedByItsSizeWithoutBeingRead) {
 }
 
 TEST(DocumentExamples, TheRepositoryExamplesReadAsExpected) {
-  const std::string examples = std::string(TENON_SOURCE_DIR) + "/examples/documents/";
+  const std::string examples = std::string(TENON_SOURCE_DIR "/examples/documents/");
   Result<Value> annotations = readDocumentFile(examples + "annotations.xml");
   ASSERT_TRUE(annotations) << annotations.error().localizedDescription();
   EXPECT_EQ((*annotations)["version"].kind(), Value::Kind::Int);

@@ -64,7 +64,8 @@ TEST(JsonDocument, ReadsAHandWrittenPlugInManifestInOrder) {
   "XTExtension": {
     "XTExtensionPointIdentifier": "com.ostrel.share-services",
     "XTExtensionAttributes": {
-      "XTExtensionActivationRule": "SUBQUERY(items, $item, $item.type == \"public.text\").@count >= 1",
+      "XTExtensionActivationRule": {"accepts": {"text/plain": 1}},
+      "Summary": "shares \"text/plain\" items",
       "MaxItems": 10,
       "Ratio": 0.75,
       "Beta": false,
@@ -83,7 +84,8 @@ TEST(JsonDocument, ReadsAHandWrittenPlugInManifestInOrder) {
            {"XTExtensionPointIdentifier", "com.ostrel.share-services"},
            {"XTExtensionAttributes",
             Value(Dictionary{{"XTExtensionActivationRule",
-                              "SUBQUERY(items, $item, $item.type == \"public.text\").@count >= 1"},
+                              Value(Dictionary{{"accepts", Value(Dictionary{{"text/plain", 1}})}})},
+                             {"Summary", "shares \"text/plain\" items"},
                              {"MaxItems", 10},
                              {"Ratio", 0.75},
                              {"Beta", false},

@@ -32,6 +32,12 @@ TEST(URL, ParseRefusesMalformedText) {
   for (const char* bad : {"", "/no/scheme", ":x", "1ab://x", "file:///a%2", "file:///a%", "file:///%G0",
                           "file:///nul%00byte"})
     EXPECT_FALSE(URL::parse(bad)) << bad;
+  // A raw NUL anywhere: in the path, the host, the scheme, or after a '?'
+  // that would otherwise drop it.
+  using namespace std::string_view_literals;
+  for (const std::string_view bad : {"file:///opt/A.tnx\0/x"sv, "file://host\0/x"sv, "fi\0le:///x"sv,
+                                     "file:///x?\0"sv, "file:///x\0"sv})
+    EXPECT_FALSE(URL::parse(bad)) << bad.size();
 }
 
 }  // namespace

@@ -155,7 +155,7 @@ TEST(XmlDocument, ReadsAHandWrittenPlugInManifest) {
       "    <item key=\"XTExtension\">\r\n"
       "      <map>\r\n"
       "        <item key=\"XTExtensionPointIdentifier\"><str>com.ostrel.share-services</str></item>\r\n"
-      "        <item key=\"XTExtensionActivationRule\"><str><![CDATA[$item.type == \"public.text\" && 1 < 2]]></str></item>\r\n"
+      "        <item key=\"Summary\"><str><![CDATA[<b>\"text/plain\" & more</b>]]></str></item>\r\n"
       "        <item key=\"MaxItems\"><int> 10\r\n</int></item>\r\n"
       "        <item key=\"Ratio\"><real>0.75</real></item>\r\n"
       "        <item key=\"Beta\"><bool>false</bool></item>\r\n"
@@ -173,7 +173,7 @@ TEST(XmlDocument, ReadsAHandWrittenPlugInManifest) {
       {"BNBundleIdentifier", "com.example.notes.share"},
       {"BNBundleVersion", "2.4.1"},
       {"XTExtension", Value(Dictionary{{"XTExtensionPointIdentifier", "com.ostrel.share-services"},
-                                       {"XTExtensionActivationRule", "$item.type == \"public.text\" && 1 < 2"},
+                                       {"Summary", "<b>\"text/plain\" & more</b>"},
                                        {"MaxItems", 10},
                                        {"Ratio", 0.75},
                                        {"Beta", false}})},

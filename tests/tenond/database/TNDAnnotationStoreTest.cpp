@@ -3,6 +3,8 @@
 
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
+#include <sys/file.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 
@@ -50,6 +52,33 @@ TEST_F(AnnotationStore, FirstStartIsEmptyQuietAndWritesNothingUntilAChange) {
   const Value file = readFile();
   EXPECT_EQ(file["version"], Value(16));
   EXPECT_EQ(file["data"], Value(Dictionary{{"com.example.a", Value(Dictionary{{"election", Value(1)}})}}));
+}
+
+TEST_F(AnnotationStore, StartUpRemovesTemporariesOfInterruptedSavesOnly) {
+  {
+    TNDAnnotationStore store(path_);
+    store.setAnnotation(Dictionary{{"election", Value(1)}}, "com.example.a");
+  }
+  const auto temporary = [&](const std::string& random) {
+    const std::string path = temp_ / (".Tenon-Annotations.tenon-tmp." + random);
+    std::ofstream(path) << "<half";
+    return path;
+  };
+  const std::string dead1 = temporary("k1ll3d");
+  const std::string dead2 = temporary("Zz9Yy8");
+  const std::string live = temporary("aL1ve0");
+  const int liveFd = ::open(live.c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(liveFd, 0);
+  ASSERT_EQ(::flock(liveFd, LOCK_EX), 0);
+
+  tn::log::ScopedCaptureSink capture;
+  const TNDAnnotationStore store(path_);
+  ::close(liveFd);
+  EXPECT_FALSE(std::filesystem::exists(dead1));
+  EXPECT_FALSE(std::filesystem::exists(dead2));
+  EXPECT_TRUE(std::filesystem::exists(live));
+  EXPECT_TRUE(logged(capture, "removed 2 stale temporary files in " + directory_));
+  EXPECT_EQ(Value(*store.annotationForIdentifier("com.example.a")), Value(Dictionary{{"election", Value(1)}}));
 }
 
 TEST_F(AnnotationStore, ChangesMergeByKeyAndNoneRemovesTheEntry) {
@@ -139,6 +168,59 @@ TEST_F(AnnotationStore, ASaveOverAFileThatIsADirectoryFailsWithoutThrowing) {
   store.setAnnotation(Dictionary{{"election", Value(1)}}, "k");
   EXPECT_TRUE(store.annotationForIdentifier("k"));
   EXPECT_TRUE(logged(capture, "unable to save annotations:"));
+}
+
+// A request that changes many entries writes the file once, when it asks.
+TEST_F(AnnotationStore, DeferredChangesReachTheFileAtTheNextSaveOnly) {
+  TNDAnnotationStore store(path_);
+  using Save = TNDAnnotationStore::Save;
+  EXPECT_FALSE(store.setAnnotation(Dictionary{{"election", Value(1)}}, "a", Save::Deferred));
+  EXPECT_FALSE(store.setAnnotation(Dictionary{{"election", Value(0)}}, "b", Save::Deferred));
+  EXPECT_FALSE(std::filesystem::exists(path_));
+  EXPECT_TRUE(store.hasUnsavedChanges());
+  store.saveIfNeeded();
+  EXPECT_FALSE(store.hasUnsavedChanges());
+  EXPECT_EQ(readFile()["data"], Value(store.annotations()));
+
+  std::filesystem::remove(path_);
+  store.saveIfNeeded();
+  EXPECT_FALSE(std::filesystem::exists(path_)) << "nothing to save, nothing written";
+  // A save that fails leaves the change unsaved, for the next one to write.
+  {
+    const FileSizeLimit full(16);
+    EXPECT_FALSE(store.setAnnotation(Dictionary{{"election", Value(2)}}, "a", Save::Now));
+  }
+  EXPECT_TRUE(store.hasUnsavedChanges());
+  store.saveIfNeeded();
+  EXPECT_EQ(readFile()["data"]["a"]["election"], Value(2));
+}
+
+// Whatever clients store, the file stays one that the store reads back.
+TEST_F(AnnotationStore, EntriesBeyondTheBoundsAreRefusedWithNothingChanged) {
+  TNDAnnotationStore store(path_);
+  const Value big(std::string(TNDAnnotationStore::kMaxEntrySize, 'x'));
+  const std::optional<tn::Error> tooLarge = store.setAnnotation(Dictionary{{"extension", Value(Dictionary{{"b", big}})}}, "k");
+  ASSERT_TRUE(tooLarge);
+  EXPECT_EQ(tooLarge->code(), 4);
+  EXPECT_NE(tooLarge->localizedDescription().find("annotation for k refused: "), std::string::npos);
+  Value deep(1);
+  for (int level = 0; level < TNDAnnotationStore::kMaxEntryDepth; ++level) deep = Value(tn::Array{deep});
+  EXPECT_TRUE(store.setAnnotation(Dictionary{{"extension", deep}}, "k"));
+  EXPECT_TRUE(store.setAnnotation(Dictionary{{"when", Value(tn::Date{1e300})}}, "k")) << "a date with no written form";
+  EXPECT_TRUE(store.annotations().empty());
+  EXPECT_FALSE(std::filesystem::exists(path_));
+
+  // The whole map is bounded too; an entry may still shrink or go.
+  const Dictionary chunk{{"extension", Value(Dictionary{{"b", Value(std::string(60 * 1024, 'x'))}})}};
+  int stored = 0;
+  while (!store.setAnnotation(chunk, "k" + std::to_string(stored), TNDAnnotationStore::Save::Deferred)) ++stored;
+  EXPECT_GT(stored, 100);
+  EXPECT_LE(store.storedSize(), TNDAnnotationStore::kMaxStoreSize);
+  EXPECT_FALSE(store.setAnnotation(Dictionary{{"extension", Value(Dictionary{})}}, "k0", TNDAnnotationStore::Save::Deferred));
+  EXPECT_FALSE(store.setAnnotation(std::nullopt, "k1"));
+  EXPECT_FALSE(store.setAnnotation(chunk, "again"));
+  EXPECT_EQ(TNDAnnotationStore(path_).storedSize(), store.storedSize()) << "measured again when loaded";
+  EXPECT_EQ(Value(TNDAnnotationStore(path_).annotations()), Value(store.annotations()));
 }
 
 }  // namespace

@@ -5,6 +5,8 @@
 
 #include <gtest/gtest.h>
 
+#include <cmath>
+
 #include <fstream>
 
 #include "platform/dispatch/Semaphore.h"
@@ -139,6 +141,32 @@ TEST_F(Database, AutoElectionStoresElectionOneOnceAndRespectsNonZeroChoices) {
   // And the file says so.
   const Value file = *tn::readDocumentFile(root_.annotationsPath());
   EXPECT_EQ(file["data"]["com.example.auto"]["election"], Value(1));
+}
+
+// Elections stored as floating numbers are compared by value: never
+// converted to an integer (undefined for huge numbers and NaN).
+TEST_F(Database, AutoElectionComparesStoredElectionsByValue) {
+  const std::string bundle = root_.makeAppWithPlugIn("Auto", "com.example.auto");
+  tn::test::writeFile(bundle + "/Entitlements.manifest", R"({"com.ostrel.developer.auto-elect-plugin": true})");
+  const std::string other = root_.makeAppWithPlugIn("Other", "com.example.other");
+  open();
+  const tn::UUID uuid = uuidAt(bundle);
+  auto plugIn = database_->findPlugIn(uuid);
+  ASSERT_TRUE(plugIn);
+  database_->setCacheLimit(0);
+  const std::vector<std::pair<Value, Value>> cases = {
+      {Value(1e300), Value(1e300)},       {Value(-1e300), Value(-1e300)}, {Value(0.5), Value(0.5)},
+      {Value(std::nan("")), Value(std::nan(""))}, {Value(-0.0), Value(1)}, {Value(false), Value(1)},
+      {Value("2"), Value(1)},            {Value(18446744073709551615ULL), Value(18446744073709551615ULL)},
+  };
+  for (const auto& [stored, expected] : cases) {
+    database_->setAnnotation(Dictionary{{"election", stored}}, *plugIn);
+    database_->findPlugIn(uuidAt(other));  // purges, so the next find builds the record again
+    plugIn = database_->findPlugIn(uuid);
+    ASSERT_TRUE(plugIn);
+    EXPECT_TRUE(Value::identical(Value(*database_->annotationForPlugIn(*plugIn))["election"], expected))
+        << stored.description();
+  }
 }
 
 TEST_F(Database, ReplacementPlugInsShareTheAnnotationOfThePlugInTheyReplace) {

@@ -4,6 +4,8 @@
 
 #include <gtest/gtest.h>
 
+#include <unistd.h>
+
 #include "platform/log/CaptureSink.h"
 #include "platform/sandbox/Extensions.h"
 #include "tests/tenond/database/DatabaseTestSupport.h"
@@ -140,6 +142,27 @@ TEST_F(DaemonPlugIn, FormsGetTokensThatConsumeForTheSharedResourcesAndTheService
   buildAt(data)->augmentForm(dataForm);
   EXPECT_TRUE(Value(dataForm)["extensions"]["."].string());
   EXPECT_FALSE(dataForm.contains("service-extension")) << "data plug-ins have no service";
+}
+
+TEST_F(DaemonPlugIn, ResourcesOutsideTheBundleGetNoTokenAndAreLogged) {
+  const std::string shared = root_.makeAppWithPlugIn(
+      "Sneaky", "com.example.sneaky", R"(, "Shared": ["../", "/etc/passwd", "Root", "Inside", "Shared/../.."])");
+  tn::test::makeDirectory(shared + "/Shared");
+  ASSERT_EQ(::symlink("/", (shared + "/Root").c_str()), 0);
+  ASSERT_EQ(::symlink("Shared", (shared + "/Inside").c_str()), 0);
+  open();
+  tn::log::ScopedCaptureSink capture;
+  Dictionary form;
+  buildAt(shared)->augmentForm(form);
+  const Value extensions = Value(form)["extensions"];
+  ASSERT_TRUE(extensions.isDictionary()) << Value(form).description();
+  EXPECT_EQ(extensions.dictionary()->size(), 1u) << extensions.description();
+  EXPECT_TRUE(extensions["Inside"].string()) << "a link that stays inside is fine";
+  for (const std::string resource : {"../", "/etc/passwd", "Root", "Shared/../.."}) {
+    EXPECT_TRUE(capture->contains("ops", tn::log::Level::Info,
+                                  "refusing extension for resource " + resource + " of plug-in at " + shared))
+        << resource;
+  }
 }
 
 TEST_F(DaemonPlugIn, TheInformationDictionaryFollowsTheRegistrarsKnowledge) {

@@ -1,0 +1,294 @@
+#include "tenond/requests/Discovery.h"
+
+#include <algorithm>
+
+#include <fmt/format.h>
+
+#include "libtenon/model/PlugInKeys.h"
+#include "libtenon/model/VersionComparison.h"
+#include "platform/log/Log.h"
+#include "tenond/server/TNDServer.h"
+
+namespace tnd {
+namespace {
+
+namespace formkeys = tn::formkeys;
+
+std::string uuidText(const TNDPlugIn& plugIn) { return plugIn.uuid() ? plugIn.uuid()->string() : "(null)"; }
+
+StepVerdict pass(std::string step, std::string reason) { return StepVerdict{std::move(step), true, std::move(reason), {}}; }
+StepVerdict refuse(std::string step, std::string reason) {
+  return StepVerdict{std::move(step), false, std::move(reason), {}};
+}
+
+// A version as the comparison takes it: a string, or none.
+std::optional<std::string> versionText(const tn::Value& version) {
+  if (const std::string* text = version.string()) return *text;
+  return std::nullopt;
+}
+
+}  // namespace
+
+Discovery::Discovery(Request request)
+    : server_(std::move(request.server)),
+      host_(std::move(request.host)),
+      rules_(std::move(request.rules)),
+      flags_(request.flags),
+      exclusions_(std::move(request.exclusions)),
+      addAnnotation_(std::move(request.addAnnotation)),
+      log_(request.log),
+      context_(TNDMatchContext::current()),
+      held_(server_->heldPlugIns()) {
+  if (const std::shared_ptr<tn::TNBundle> bundle = host_->bundle()) plugInsPath_ = bundle->plugInsPath();
+}
+
+std::vector<PlugInPtr> Discovery::preferBundleRelative(std::vector<PlugInPtr> candidates,
+                                                       DiscoveryTrace* trace) const {
+  const std::string executable = host_->executablePath();
+  if (executable.empty()) {
+    if (log_) TN_LOG_ERROR(tn::log::ops(), "Failed to determine path for pid {}, {}", hostPid(), ENOENT);
+    return candidates;
+  }
+  // The host's own copy of each identifier: the last candidate, in order,
+  // whose containing application holds the host's executable.
+  std::unordered_map<std::string, const TNDPlugIn*> own;
+  for (const PlugInPtr& candidate : candidates) {
+    const std::optional<std::string> containing = candidate->containingPath();
+    if (containing && executable.starts_with(*containing) && candidate->identifier()) {
+      own[*candidate->identifier()] = candidate.get();
+    }
+  }
+  std::vector<PlugInPtr> kept;
+  for (PlugInPtr& candidate : candidates) {
+    const auto found = candidate->identifier() ? own.find(*candidate->identifier()) : own.end();
+    if (found == own.end() || found->second == candidate.get()) {
+      kept.push_back(std::move(candidate));
+      continue;
+    }
+    const std::string preferred = found->second->path().value_or("");
+    if (log_) {
+      TN_LOG_INFO(tn::log::ops(), "Ignoring {} @ '{}' in favor of bundle-relative '{}'", uuidText(*candidate),
+                  candidate->path().value_or(""), preferred);
+    }
+    if (trace && candidate->uuid() == trace->subject) {
+      trace->verdicts.push_back(refuse("bundle-relative preference",
+                                       fmt::format("the host carries its own copy of {} at {}",
+                                                   candidate->identifier().value_or(""), preferred)));
+    }
+  }
+  return kept;
+}
+
+StepVerdict Discovery::location(const TNDPlugIn& plugIn) const {
+  if (plugIn.onSystemVolume()) return pass("location", "on the system volume");
+  if (!plugIn.containingUrl()) return refuse("location", "neither on the system volume nor inside an application");
+  if ((flags_ & kDiscoverSystemOnly) != 0) {
+    return refuse("location", "not on the system volume, and the host asked for system plug-ins only");
+  }
+  return pass("location", "inside the application " + plugIn.containingPath().value_or(""));
+}
+
+StepVerdict Discovery::dedication(const TNDPlugIn& plugIn) const {
+  if (!plugIn.isDedicated()) return pass("dedication", "not dedicated to one host");
+  if (!plugInsPath_) return refuse("dedication", "dedicated to the application that holds it; the host is in no bundle");
+  if (plugIn.path().value_or("").starts_with(*plugInsPath_)) {
+    return pass("dedication", "dedicated to this host, whose PlugIns directory holds it");
+  }
+  return refuse("dedication", "dedicated to the application that holds it, not to this host");
+}
+
+StepVerdict Discovery::hold(const TNDPlugIn& plugIn) const {
+  if (plugIn.uuid() && held_.contains(*plugIn.uuid())) return refuse("hold", "a hold blocks it");
+  return pass("hold", "no hold blocks it");
+}
+
+StepVerdict Discovery::rules(const TNDPlugIn& plugIn) const {
+  StepVerdict verdict = pass("rules", "it matches every rule");
+  const tn::Dictionary* entries = rules_.dictionary();
+  if (entries == nullptr || entries->empty()) {
+    verdict.reason = "no rules";
+    return verdict;
+  }
+  for (const auto& [key, pattern] : *entries) {
+    const bool matched = plugIn.matchKey(key, pattern, context_);
+    verdict.details.push_back(tn::Value(tn::Dictionary{{"key", key}, {"pattern", pattern}, {"passed", matched}}));
+    if (!matched && verdict.passed) {
+      verdict.passed = false;
+      verdict.reason = fmt::format("it does not match the rule {}: {}", key, pattern.description());
+    }
+  }
+  // The run's own answer decides (it also bounds the work of the whole
+  // dictionary, which entry by entry does not see).
+  if (verdict.passed && !plugIn.match(rules_, context_)) {
+    verdict.passed = false;
+    verdict.reason = "the rules as a whole are too large to evaluate";
+  }
+  return verdict;
+}
+
+StepVerdict Discovery::exclusions(const TNDPlugIn& plugIn) const {
+  const tn::Array* list = exclusions_.array();
+  if (list == nullptr) return pass("exclusions", "the user excludes nothing");
+  for (const tn::Value& exclusion : *list) {
+    if (plugIn.match(exclusion, context_)) {
+      return refuse("exclusions", "the user excludes it: " + exclusion.description());
+    }
+  }
+  return pass("exclusions", "no exclusion of the user matches it");
+}
+
+StepVerdict Discovery::hostAuthorization(const TNDPlugIn& plugIn) const {
+  if (const std::optional<std::string> reason = plugIn.allowForClient(*host_, context_)) {
+    return refuse("host authorization", *reason);
+  }
+  return pass("host authorization", "the host may use it");
+}
+
+std::vector<StepVerdict> Discovery::allSteps(const TNDPlugIn& plugIn) const {
+  std::vector<StepVerdict> steps;
+  if (discoverAll()) {
+    steps.push_back(pass("location", "not checked: the host discovers all"));
+    steps.push_back(pass("dedication", "not checked: the host discovers all"));
+    steps.push_back(pass("hold", "not checked: the host discovers all"));
+  } else {
+    steps.push_back(location(plugIn));
+    steps.push_back(dedication(plugIn));
+    steps.push_back(hold(plugIn));
+  }
+  steps.push_back(rules(plugIn));
+  steps.push_back(exclusions(plugIn));
+  steps.push_back(discoverAll() ? pass("host authorization", "not checked: the host discovers all")
+                                : hostAuthorization(plugIn));
+  return steps;
+}
+
+std::optional<StepVerdict> Discovery::firstRefusal(const TNDPlugIn& plugIn) const {
+  if (!discoverAll()) {
+    for (StepVerdict verdict : {location(plugIn), dedication(plugIn), hold(plugIn)}) {
+      if (!verdict.passed) return verdict;
+    }
+  }
+  if (!plugIn.match(rules_, context_)) return refuse("rules", "it does not match the rules");
+  if (StepVerdict excluded = exclusions(plugIn); !excluded.passed) {
+    if (log_) TN_LOG_INFO(tn::log::ops(), "client {} plugin {} globally excluded", hostPid(), uuidText(plugIn));
+    return excluded;
+  }
+  if (!discoverAll()) {
+    if (StepVerdict allowed = hostAuthorization(plugIn); !allowed.passed) {
+      if (log_) {
+        TN_LOG_INFO(tn::log::ops(), "client {} cannot use plugin {}: {}", hostPid(), uuidText(plugIn),
+                    allowed.reason);
+      }
+      return allowed;
+    }
+  }
+  return std::nullopt;
+}
+
+tn::Array Discovery::run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trace) {
+  std::vector<Result> results;
+  for (const PlugInPtr& candidate : preferBundleRelative(std::move(candidates), trace)) {
+    const bool traced = trace && candidate->uuid() == trace->subject;
+    if (std::optional<StepVerdict> refusal = firstRefusal(*candidate)) {
+      if (traced) trace->verdicts.push_back(std::move(*refusal));
+      continue;
+    }
+    tn::Result<tn::Dictionary> form = candidate->exportForm();
+    if (!form.ok()) {
+      if (log_) {
+        TN_LOG_ERROR(tn::log::ops(), "failed to export matching plug-in {}: {}", uuidText(*candidate),
+                     form.error().description());
+      }
+      if (traced) trace->verdicts.push_back(refuse("export", form.error().localizedDescription()));
+      continue;
+    }
+    if (!reduceDuplicates(*candidate, results, trace)) continue;
+    results.push_back(Result{candidate, completedForm(*candidate, std::move(*form))});
+  }
+  markReplacements(results, trace);
+  tn::Array forms;
+  forms.reserve(results.size());
+  for (Result& result : results) {
+    if (trace && result.plugIn->uuid() == trace->subject) trace->offered = true;
+    forms.emplace_back(std::move(result.form));
+  }
+  return forms;
+}
+
+tn::Dictionary Discovery::completedForm(const TNDPlugIn& plugIn, tn::Dictionary form) const {
+  addAnnotation_(plugIn, form);
+  plugIn.augmentForm(form);
+  return form;
+}
+
+bool Discovery::reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& results,
+                                 DiscoveryTrace* trace) const {
+  const bool allVersions = (flags_ & kDiscoverAllVersions) != 0;
+  if (allVersions && (flags_ & kDiscoverDuplicates) != 0) return true;
+  const std::optional<std::string> mine = versionText(plugIn.version());
+  const bool traced = trace && plugIn.uuid() == trace->subject;
+  for (auto earlier = results.begin(); earlier != results.end(); ++earlier) {
+    if (earlier->plugIn->identifier() != plugIn.identifier()) continue;
+    const std::optional<std::string> theirs = versionText(earlier->form.get(formkeys::kVersion));
+    const int order = mine && theirs ? tn::compareVersionString(*mine, *theirs) : 0;
+    if (order != 0 && allVersions) continue;  // another version: both stay
+    const bool wins = order > 0 || (order == 0 && preferredOver(plugIn, earlier->form));
+    const std::string other = uuidText(*earlier->plugIn);
+    if (traced) {
+      trace->verdicts.push_back(wins ? pass("duplicates", "preferred to " + other + ", which it replaces")
+                                     : refuse("duplicates", "another copy is preferred: " + other));
+    } else if (trace && earlier->plugIn->uuid() == trace->subject && wins) {
+      trace->verdicts.push_back(refuse("duplicates", "another copy is preferred: " + uuidText(plugIn)));
+    }
+    if (!wins) return false;
+    results.erase(earlier);
+    return true;
+  }
+  if (traced) trace->verdicts.push_back(pass("duplicates", "no other copy of its identifier was offered before it"));
+  return true;
+}
+
+bool Discovery::preferredOver(const TNDPlugIn& plugIn, const tn::Dictionary& form) const {
+  const bool theirsOnSystem = form.get(formkeys::kSystemResident) == tn::Value(true);
+  if (!plugIn.onSystemVolume() && theirsOnSystem) return false;
+  if (plugIn.onSystemVolume() && !theirsOnSystem) return true;
+  const std::optional<int64_t> theirs = form.get(formkeys::kLastModified).int64();
+  return plugIn.lastModified() > theirs.value_or(0);
+}
+
+void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* trace) const {
+  // Who replaces whom, by identifier: a later declaration of the same
+  // identifier wins.
+  std::unordered_map<std::string, Result*> replacements;
+  for (Result& result : results) {
+    const tn::Value declared = result.plugIn->valueForEntitlement(TNDPlugIn::kReplacePlugInEntitlement);
+    if (const std::string* one = declared.string()) replacements[*one] = &result;
+    if (const tn::Array* many = declared.array()) {
+      for (const tn::Value& element : *many) {
+        if (const std::string* identifier = element.string()) replacements[*identifier] = &result;
+      }
+    }
+  }
+  if (replacements.empty()) return;
+  for (Result& result : results) {
+    const std::optional<std::string> identifier = result.plugIn->identifier();
+    const auto found = identifier ? replacements.find(*identifier) : replacements.end();
+    if (found == replacements.end()) continue;
+    Result& overrider = *found->second;
+    const tn::Value overriderUUID = overrider.form.get(formkeys::kUUID);
+    result.form.set("overrider", overriderUUID);
+    overrider.form.set("overriding", tn::Value(*identifier));
+    if (log_) {
+      TN_LOG_INFO(tn::log::ops(), "plug-in {} overrides {}", overriderUUID.description(),
+                  result.form.get(formkeys::kUUID).description());
+    }
+    if (trace && result.plugIn->uuid() == trace->subject) {
+      trace->verdicts.push_back(pass("replacement", "replaced by " + uuidText(*overrider.plugIn) + " (overrider)"));
+    }
+    if (trace && overrider.plugIn->uuid() == trace->subject) {
+      trace->verdicts.push_back(pass("replacement", "replaces " + *identifier + " (overriding)"));
+    }
+  }
+}
+
+}  // namespace tnd

@@ -1,0 +1,52 @@
+#pragma once
+
+// TNDConfiguration: the daemon's settings, from the administrator's document
+// $TENON_ROOT/etc/tenon/tenond.manifest (TENON_ROOT empty or unset: /etc/...),
+// a structured-value document (XML or JSON) holding a dictionary:
+//
+//   {"privileged-groups": ["tenon-admin", 1001],
+//    "connections-per-user": 64, "connections-total": 4096}
+//
+// docs/configuration.md describes the keys for administrators. The document
+// is read once, when the server is made, and only when it passes the trust
+// rule of entitlement documents (owned by root or the daemon's user, written
+// by nobody else, in directories nobody else can write to): a user who could
+// write it could make himself privileged. A missing file means defaults. An
+// untrusted or malformed file, or a key whose value has the wrong type or
+// names an unknown group, gives one error line on the "ops" category naming
+// the file (and the key), and that key's default. Unknown keys are named the
+// same way and ignored.
+
+#include <sys/types.h>
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/value/Value.h"
+
+namespace tnd {
+
+struct TNDConfiguration {
+  // "privileged-groups": group names or numbers; members may do what the
+  // manager entitlement allows, besides root and the daemon's user. Default
+  // none.
+  std::vector<gid_t> privilegedGroups;
+  // "connections-per-user": live connections one uid may have; positive.
+  std::optional<std::size_t> connectionsPerUser;
+  // "connections-total": live connections of all users together; positive.
+  std::optional<std::size_t> connectionsTotal;
+
+  // The configuration of $TENON_ROOT/etc/tenon/tenond.manifest (see above).
+  static TNDConfiguration load();
+
+  // The configuration a parsed document holds; path only names the file in
+  // log lines. Logs as load() does.
+  static TNDConfiguration fromDocument(const tn::Value& document, const std::string& path);
+
+  // $TENON_ROOT/etc/tenon/tenond.manifest.
+  static std::string path();
+};
+
+}  // namespace tnd

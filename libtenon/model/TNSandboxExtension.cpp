@@ -70,9 +70,13 @@ Result<std::string> bundleResourcePath(std::string_view bundlePath, std::string_
 Result<std::string> issueBundleResourceExtension(const URL& bundle, std::string_view resource) {
   Result<std::string> path = bundleResourcePath(bundle.path(), resource);
   if (!path) return path.error();
+  return issueCheckedResourceExtension(*path);
+}
+
+Result<std::string> issueCheckedResourceExtension(std::string_view canonicalPath) {
   // Already canonical and checked: issued as it is, not resolved again.
-  Result<std::string> token = sandbox::issueFileExtension(sandbox::kReadOnlyFileExtensionClass, *path, 0);
-  if (token) TN_LOG_DEBUG(log::sandbox(), "issued file extension for {} -> {}", *path, *token);
+  Result<std::string> token = sandbox::issueFileExtension(sandbox::kReadOnlyFileExtensionClass, canonicalPath, 0);
+  if (token) TN_LOG_DEBUG(log::sandbox(), "issued file extension for {} -> {}", canonicalPath, *token);
   return token;
 }
 

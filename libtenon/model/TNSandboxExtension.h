@@ -42,6 +42,10 @@ Result<std::string> bundleResourcePath(std::string_view bundlePath, std::string_
 // issuer's. Logged like issueFileExtension.
 Result<std::string> issueBundleResourceExtension(const URL& bundle, std::string_view resource);
 
+// The same for a canonical path that bundleResourcePath() has already
+// answered (a caller that keeps those answers resolves each only once).
+Result<std::string> issueCheckedResourceExtension(std::string_view canonicalPath);
+
 // A service-lookup extension of class "com.ostrel.tenon.plugin-service" for
 // the service name. Logged like issueFileExtension.
 Result<std::string> issueServiceExtension(std::string_view serviceName);

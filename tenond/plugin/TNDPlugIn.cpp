@@ -151,7 +151,7 @@ tn::Dictionary TNDPlugIn::issueResourceExtensions(const tn::Value& resources) co
   for (const tn::Value& element : list) {
     const std::string* resource = element.string();
     if (resource == nullptr) continue;
-    tn::Result<std::string> token = tn::issueBundleResourceExtension(*bundle, *resource);
+    tn::Result<std::string> token = issueResourceExtension(*bundle, *resource);
     if (!token.ok() && token.error().code() == EPERM) {
       TN_LOG_INFO(tn::log::ops(), "refusing extension for resource {} of plug-in at {}: {}", *resource,
                   bundle->path(), token.error().localizedDescription());
@@ -165,6 +165,22 @@ tn::Dictionary TNDPlugIn::issueResourceExtensions(const tn::Value& resources) co
     tokens.set(*resource, tn::Value(*token));
   }
   return tokens;
+}
+
+tn::Result<std::string> TNDPlugIn::issueResourceExtension(const tn::URL& bundle, const std::string& resource) const {
+  {
+    std::lock_guard lock(resourcePathsMutex_);
+    if (const auto known = resourcePaths_.find(resource); known != resourcePaths_.end()) {
+      return tn::issueCheckedResourceExtension(known->second);
+    }
+  }
+  tn::Result<std::string> path = tn::bundleResourcePath(bundle.path(), resource);
+  if (!path) return path.error();
+  {
+    std::lock_guard lock(resourcePathsMutex_);
+    resourcePaths_.emplace(resource, *path);
+  }
+  return tn::issueCheckedResourceExtension(*path);
 }
 
 void TNDPlugIn::augmentForm(tn::Dictionary& form) const {

@@ -19,6 +19,7 @@
 #include <set>
 #include <optional>
 #include <string>
+#include <unordered_map>
 
 #include "libtenon/model/AtomicProperty.h"
 #include "libtenon/model/TNPlugInCore.h"
@@ -92,6 +93,8 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   // bundle (links followed) gets no token: it is logged at info level on
   // "ops" as "refusing extension for resource <name> of plug-in at <path>".
   tn::Dictionary issueResourceExtensions(const tn::Value& resources) const;
+  // A read-only extension for one resource of the bundle (see resourcePaths_).
+  tn::Result<std::string> issueResourceExtension(const tn::URL& bundle, const std::string& resource) const;
 
   // --- Matching rules (TNDPlugInMatching.cpp) ---
   //
@@ -172,6 +175,13 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   mutable tn::AtomicProperty<tn::Value> infoManifest_;
   mutable tn::AtomicProperty<std::optional<tn::UUID>> rgKnowledgeUUID_;
   mutable std::mutex refreshMutex_;  // one refresh of infoManifest_ at a time
+  // The canonical paths of the resources the record has shared so far, by
+  // resource name: resolving them costs several system calls per resource,
+  // and every form a host gets needs them. Only successes are kept (a
+  // resource that appears later is found then); a kept path was inside the
+  // bundle when it was checked, and the token names exactly that path.
+  mutable std::mutex resourcePathsMutex_;
+  mutable std::unordered_map<std::string, std::string> resourcePaths_;
 };
 
 }  // namespace tnd

@@ -187,6 +187,9 @@ std::optional<StepVerdict> Discovery::firstRefusal(const TNDPlugIn& plugIn) cons
 
 tn::Array Discovery::run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trace) {
   std::vector<Result> results;
+  // Where the results of each identifier are, so that duplicate reduction
+  // looks only at those (a registry of thousands must not cost a square).
+  std::unordered_map<std::optional<std::string>, std::vector<std::size_t>, IdentifierHash> byIdentifier;
   for (const PlugInPtr& candidate : preferBundleRelative(std::move(candidates), trace)) {
     const bool traced = trace && candidate->uuid() == trace->subject;
     if (std::optional<StepVerdict> refusal = firstRefusal(*candidate)) {
@@ -202,13 +205,17 @@ tn::Array Discovery::run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trac
       if (traced) trace->verdicts.push_back(refuse("export", form.error().localizedDescription()));
       continue;
     }
-    if (!reduceDuplicates(*candidate, results, trace)) continue;
-    results.push_back(Result{candidate, completedForm(*candidate, std::move(*form))});
+    std::optional<std::string> identifier = candidate->identifier();
+    std::vector<std::size_t>& sameIdentifier = byIdentifier[identifier];
+    if (!reduceDuplicates(*candidate, results, sameIdentifier, trace)) continue;
+    sameIdentifier.push_back(results.size());
+    results.push_back(Result{candidate, std::move(identifier), completedForm(*candidate, std::move(*form))});
   }
   markReplacements(results, trace);
   tn::Array forms;
   forms.reserve(results.size());
   for (Result& result : results) {
+    if (result.dropped) continue;
     if (trace && result.plugIn->uuid() == trace->subject) trace->offered = true;
     forms.emplace_back(std::move(result.form));
   }
@@ -222,26 +229,27 @@ tn::Dictionary Discovery::completedForm(const TNDPlugIn& plugIn, tn::Dictionary 
 }
 
 bool Discovery::reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& results,
-                                 DiscoveryTrace* trace) const {
+                                 const std::vector<std::size_t>& sameIdentifier, DiscoveryTrace* trace) const {
   const bool allVersions = (flags_ & kDiscoverAllVersions) != 0;
   if (allVersions && (flags_ & kDiscoverDuplicates) != 0) return true;
   const std::optional<std::string> mine = versionText(plugIn.version());
   const bool traced = trace && plugIn.uuid() == trace->subject;
-  for (auto earlier = results.begin(); earlier != results.end(); ++earlier) {
-    if (earlier->plugIn->identifier() != plugIn.identifier()) continue;
-    const std::optional<std::string> theirs = versionText(earlier->form.get(formkeys::kVersion));
+  for (const std::size_t position : sameIdentifier) {
+    Result& earlier = results[position];
+    if (earlier.dropped) continue;
+    const std::optional<std::string> theirs = versionText(earlier.form.get(formkeys::kVersion));
     const int order = mine && theirs ? tn::compareVersionString(*mine, *theirs) : 0;
     if (order != 0 && allVersions) continue;  // another version: both stay
-    const bool wins = order > 0 || (order == 0 && preferredOver(plugIn, earlier->form));
-    const std::string other = uuidText(*earlier->plugIn);
+    const bool wins = order > 0 || (order == 0 && preferredOver(plugIn, earlier.form));
+    const std::string other = uuidText(*earlier.plugIn);
     if (traced) {
       trace->verdicts.push_back(wins ? pass("duplicates", "preferred to " + other + ", which it replaces")
                                      : refuse("duplicates", "another copy is preferred: " + other));
-    } else if (trace && earlier->plugIn->uuid() == trace->subject && wins) {
+    } else if (trace && earlier.plugIn->uuid() == trace->subject && wins) {
       trace->verdicts.push_back(refuse("duplicates", "another copy is preferred: " + uuidText(plugIn)));
     }
     if (!wins) return false;
-    results.erase(earlier);
+    earlier.dropped = true;
     return true;
   }
   if (traced) trace->verdicts.push_back(pass("duplicates", "no other copy of its identifier was offered before it"));
@@ -261,6 +269,7 @@ void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* t
   // identifier wins.
   std::unordered_map<std::string, Result*> replacements;
   for (Result& result : results) {
+    if (result.dropped) continue;
     const tn::Value declared = result.plugIn->valueForEntitlement(TNDPlugIn::kReplacePlugInEntitlement);
     if (const std::string* one = declared.string()) replacements[*one] = &result;
     if (const tn::Array* many = declared.array()) {
@@ -271,7 +280,8 @@ void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* t
   }
   if (replacements.empty()) return;
   for (Result& result : results) {
-    const std::optional<std::string> identifier = result.plugIn->identifier();
+    if (result.dropped) continue;
+    const std::optional<std::string>& identifier = result.identifier;
     const auto found = identifier ? replacements.find(*identifier) : replacements.end();
     if (found == replacements.end()) continue;
     Result& overrider = *found->second;

@@ -20,6 +20,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <unordered_map>
 #include <unordered_set>
 #include <vector>
 
@@ -101,15 +102,24 @@ class Discovery {
  private:
   struct Result {
     PlugInPtr plugIn;
+    std::optional<std::string> identifier;
     tn::Dictionary form;
+    bool dropped = false;  // a later duplicate took its place
+  };
+  struct IdentifierHash {
+    std::size_t operator()(const std::optional<std::string>& identifier) const {
+      return identifier ? std::hash<std::string>()(*identifier) : 0;
+    }
   };
 
   // The steps a run takes before a candidate is exported; the first that
   // fails (logged as the run logs it) decides.
   std::optional<StepVerdict> firstRefusal(const TNDPlugIn& plugIn) const;
-  // Duplicate reduction of a new candidate against the results so far:
-  // false when the candidate is dropped; may remove one earlier result.
-  bool reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& results, DiscoveryTrace* trace) const;
+  // Duplicate reduction of a new candidate against the results so far of
+  // its identifier (positions in `results`, in the order they came): false
+  // when the candidate is dropped; may drop one earlier result.
+  bool reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& results,
+                        const std::vector<std::size_t>& sameIdentifier, DiscoveryTrace* trace) const;
   bool preferredOver(const TNDPlugIn& plugIn, const tn::Dictionary& form) const;
   void markReplacements(std::vector<Result>& results, DiscoveryTrace* trace) const;
   tn::Dictionary completedForm(const TNDPlugIn& plugIn, tn::Dictionary form) const;

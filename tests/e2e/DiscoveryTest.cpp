@@ -16,6 +16,7 @@
 
 #include "libtenon/client/TNDaemonClient.h"
 #include "platform/value/Document.h"
+#include "platform/value/TypedEncoding.h"
 #include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/RelayPeer.h"
@@ -256,6 +257,119 @@ TEST_F(Discovery, ExplainSaysWhyAHostIsRefused) {
             "tnctl: error 11: explaining for another host requires a manager\n");
   const Value forViewer = json(entitledTnctl(), {"explain", "--path", demanding, "--host", viewerTnctl()});
   EXPECT_EQ(forViewer["explanation"]["host"], Value(viewerTnctl()));
+}
+
+// "explain" and "match" must never disagree: over generated rules and flags,
+// for several hosts, a plug-in is explained as offered exactly when "match"
+// returns it.
+namespace agreement {
+
+// Per rule key, the patterns a generated rules dictionary picks from: every
+// step of a discovery is reachable (identifiers, versions, attributes, types,
+// elections, containing application, entitlements, bad operators).
+const std::vector<std::pair<std::string, std::vector<std::string>>> kRulePool = {
+    {"XTExtensionIdentifier",
+     {R"("com.example.version")", R"(["com.example.tie", "com.example.shared", "com.example.dedicated"])",
+      R"("<com.example.f")", R"(["com.example.replacer", "com.example.replaced", "com.example.excluded"])"}},
+    {"XTExtensionVersion", {R"(">=2")", R"("<1.10")", R"("<>1.0")"}},
+    {"Kind", {R"("thumb")", "true", "false"}},
+    {"Type", {R"("?TY-CONFORMS:application/xml")", R"("?TY-IS:image/svg+xml")", R"("?TY-CONFORMS:image/png")"}},
+    {"XTUserElection", {R"("1")", R"(["0", "=2"])", R"(["1", ">0"])"}},
+    {"XTExtensionContainingApp", {"true", R"("?bogus")"}},
+    {"ENTITLEMENT:com.ostrel.developer.replace-plugin", {"true", "false"}},
+};
+const std::vector<uint64_t> kFlagPool = {0, 0x1, 0x1 | 0x4, 0x8, 0x1 | 0x8, 0x4};
+
+struct Case {
+  std::string rules;  // JSON
+  uint64_t flags = 0;
+};
+
+std::vector<Case> generateCases(unsigned count, unsigned seed) {
+  std::mt19937 random(seed);
+  std::vector<Case> cases;
+  for (unsigned i = 0; i < count; ++i) {
+    std::string rules;
+    for (const auto& [key, patterns] : kRulePool) {
+      if (random() % 3 != 0) continue;
+      rules += (rules.empty() ? "" : ", ") + ("\"" + key + "\": ") + patterns[random() % patterns.size()];
+    }
+    cases.push_back({"{" + rules + "}", kFlagPool[random() % kFlagPool.size()]});
+  }
+  return cases;
+}
+
+// Every plug-in bundle of the discovery world.
+std::vector<std::string> worldPlugIns(const std::string& root) {
+  std::vector<std::string> paths;
+  for (const char* applications : {"/opt/tenon/applications", "/System/Applications"}) {
+    for (const auto& application : std::filesystem::directory_iterator(root + applications)) {
+      const std::filesystem::path plugIns = application.path() / "Support/PlugIns";
+      if (!std::filesystem::is_directory(plugIns)) continue;
+      for (const auto& plugIn : std::filesystem::directory_iterator(plugIns)) paths.push_back(plugIn.path().string());
+    }
+  }
+  std::sort(paths.begin(), paths.end());
+  return paths;
+}
+
+std::string describe(const Case& c) { return c.rules + " flags " + std::to_string(c.flags); }
+
+}  // namespace agreement
+
+TEST_F(Discovery, ExplainAgreesWithMatchOverGeneratedCases) {
+  using namespace agreement;
+  const std::vector<std::string> plugIns = worldPlugIns(daemon_.root());
+  ASSERT_GE(plugIns.size(), 15u);
+  ::setenv("TENON_ROOT", daemon_.root().c_str(), 1);
+  RelayPeer peer(daemon_.service());
+  ::unsetenv("TENON_ROOT");
+  ASSERT_TRUE(peer.connected());
+
+  // This test program as the host, in-process: many cases.
+  unsigned offeredSomewhere = 0;
+  for (const Case& c : generateCases(60, 20261123)) {
+    const Value rules = *readDocument(c.rules, "rules", DocumentEncoding::Json);
+    const Value matched = peer.request({{"request", "match"}, {"version", 3}, {"rules", rules}, {"flags", c.flags}});
+    ASSERT_EQ(matched["errorcode"].uint64().value_or(0), 0u) << describe(c) << matched.description();
+    std::set<std::string> uuids;
+    const Result<Value> forms = decodeTyped(matched["matches"]);
+    ASSERT_TRUE(forms.ok() && forms->isArray()) << describe(c);
+    for (const Value& form : *forms->array()) uuids.insert(*form["uuid"].string());
+    offeredSomewhere += uuids.empty() ? 0 : 1;
+    for (const std::string& path : plugIns) {
+      const Value reply = peer.request(
+          {{"request", "explain"}, {"version", 3}, {"paths", path}, {"rules", rules}, {"flags", c.flags}});
+      const Value& explanation = reply["explanation"];
+      ASSERT_TRUE(explanation.isDictionary()) << reply.description();
+      EXPECT_EQ(explanation["offered"] == Value(true), uuids.count(*explanation["plugin"].string()) == 1)
+          << path << " for " << describe(c);
+    }
+  }
+  EXPECT_GT(offeredSomewhere, 10u) << "the generated cases should offer something often";
+
+  // Hosts that are other programs: one inside an application (its own
+  // copies, dedicated plug-ins) and a manager asking for every plug-in.
+  struct Host {
+    std::string program;
+    uint64_t extraFlags;
+  };
+  for (const Host& host : {Host{viewerTnctl(), 0}, Host{entitledTnctl(), 0x200}}) {
+    for (const Case& c : generateCases(4, 7)) {
+      const std::string flags = std::to_string(c.flags | host.extraFlags);
+      std::set<std::string> uuids;
+      const Value matched = json(host.program, {"match", "--rules", c.rules, "--flags", flags});
+      if (const Array* forms = matched["matches"].array()) {
+        for (const Value& form : *forms) uuids.insert(*form["uuid"].string());
+      }
+      for (const std::string& path : plugIns) {
+        const Value explanation =
+            json(host.program, {"explain", "--path", path, "--rules", c.rules, "--flags", flags})["explanation"];
+        EXPECT_EQ(explanation["offered"] == Value(true), uuids.count(*explanation["plugin"].string()) == 1)
+            << path << " for " << host.program << " " << describe(c);
+      }
+    }
+  }
 }
 
 }  // namespace

@@ -2,7 +2,7 @@
 
 #include <fcntl.h>
 #include <signal.h>
-#include <spawn.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <sys/wait.h>
@@ -50,6 +50,27 @@ std::vector<char*> pointersTo(std::vector<std::string>& strings) {
   return pointers;
 }
 
+// Starts the daemon with stdin and stdout on /dev/null and stderr into its
+// log, killed (SIGTERM) if this test program dies first: a crashed test must
+// neither leave a daemon behind nor keep CTest's output pipe open through
+// one. Only async-signal-safe calls between fork and exec.
+pid_t startChild(const std::vector<char*>& argp, const std::vector<char*>& envp, const std::string& logPath) {
+  const pid_t parent = ::getpid();
+  const pid_t child = ::fork();
+  if (child != 0) return child;
+  ::prctl(PR_SET_PDEATHSIG, SIGTERM);
+  if (::getppid() != parent) ::_exit(127);
+  const int in = ::open("/dev/null", O_RDONLY);
+  const int out = ::open("/dev/null", O_WRONLY);
+  const int log = ::open(logPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+  if (in < 0 || out < 0 || log < 0 || ::dup2(in, STDIN_FILENO) < 0 || ::dup2(out, STDOUT_FILENO) < 0 ||
+      ::dup2(log, STDERR_FILENO) < 0) {
+    ::_exit(127);
+  }
+  ::execve(argp[0], argp.data(), envp.data());
+  ::_exit(127);
+}
+
 }  // namespace
 
 DaemonProcess::DaemonProcess(std::string binary, std::vector<std::string> arguments,
@@ -67,13 +88,7 @@ DaemonProcess::DaemonProcess(std::string binary, std::vector<std::string> argume
   std::vector<char*> argp = pointersTo(argv);
   std::vector<char*> envp = pointersTo(env);
 
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-  posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, logPath_.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
-  if (posix_spawn(&pid_, argp[0], &actions, nullptr, argp.data(), envp.data()) != 0) pid_ = -1;
-  posix_spawn_file_actions_destroy(&actions);
-
+  pid_ = startChild(argp, envp, logPath_);
   const auto deadline = std::chrono::steady_clock::now() + kStartLimit;
   while (pid_ > 0 && std::chrono::steady_clock::now() < deadline) {
     if (socketAccepts()) {

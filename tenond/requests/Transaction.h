@@ -129,6 +129,8 @@ class Transaction {
   // "host") and plug-in ("uuids" or "paths"); none when the request failed.
   std::shared_ptr<const TNDHost> explainedHost();
   std::shared_ptr<TNDPlugIn> explainedPlugIn();
+  // "access" (AccessRequests.cpp): a read-only file token per plug-in bundle.
+  void accessPlugIns();
   // Annotation requests (AnnotationRequests.cpp).
   void annotatePlugIns();
   void bulkAnnotatePlugIns();

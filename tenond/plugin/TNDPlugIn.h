@@ -14,12 +14,14 @@
 // shared_ptr. Thread-safe: fields are atomic properties and the refresh is
 // serialised.
 
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <set>
 #include <optional>
 #include <string>
 #include <unordered_map>
+#include <vector>
 
 #include "libtenon/model/AtomicProperty.h"
 #include "libtenon/model/TNPlugInCore.h"
@@ -159,6 +161,45 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   // application (the consent store, platform/privy); empty for a plug-in
   // outside any application.
   std::set<std::string> allowedPrivyServices() const;
+
+  // --- Activation (TNDPlugInActivation.cpp) ---
+
+  // Registers (executable path, activation overlay) with the process
+  // supervisor for the host being enabled: 0, or the supervisor's error
+  // number. The caller binds it to its host (warden::Warden).
+  using ExternalServiceRegistrar = std::function<int(const std::string& executablePath, const tn::Value& overlay)>;
+  // The busy instances of some bundle identifiers (vigil::Vigil).
+  using BusyInstanceSource = std::function<std::vector<tn::Value>(const std::set<std::string>& bundleIdentifiers)>;
+
+  static constexpr const char* kEntryPadExtensionPoint = "com.ostrel.entry-pad-service";
+  static constexpr const char* kTrafficScreenExtensionPoint = "com.ostrel.trafficguard.screen-data";
+  static constexpr std::string_view kRequestsOpenAccessKey = "RequestsOpenAccess";
+  // The consent store's service for network access of entry-pad plug-ins.
+  static constexpr const char* kEntryPadNetworkService = "com.ostrel.privy.entry-pad-network";
+  static constexpr std::string_view kRelayServiceKey = "RelayService";
+  static constexpr const char* kEnvironmentVariablesKey = "EnvironmentVariables";
+  static constexpr const char* kSandboxProfileKey = "_SandboxProfile";
+  static constexpr const char* kOmitSandboxParametersKey = "_OmitSandboxParameters";
+  static constexpr const char* kBundlePackageTypeKey = "BNBundlePackageType";
+  static constexpr const char* kRelayPackageType = "RLY!";
+  // The bundle identifier's key in a busy instance and in a busy report.
+  static constexpr const char* kBusyBundleIdentifierKey = "BNBundleIdentifier";
+
+  // The sandbox profile by the extension point, with the open-access rule.
+  std::string sandboxProfile() const;
+  // The host's environment, then the data container's HOME, BNFIXED_USER_HOME
+  // and TMPDIR (when there is a container).
+  tn::Dictionary mergedEnvironment(const std::optional<tn::Dictionary>& hostEnvironment) const;
+  // {"RelayService": the service configuration, "BNBundlePackageType": "RLY!"}.
+  tn::Value activationOverlay(const std::optional<tn::Dictionary>& hostEnvironment) const;
+  // Makes the plug-in launchable for `host`: none, or an error of code 4
+  // ("cannot obtain executable path for plug-in I(U)", "unable to enable
+  // plug-in I(U)").
+  std::optional<tn::Error> enableForClient(const TNDHost& host, const std::optional<tn::Dictionary>& environment,
+                                           const ExternalServiceRegistrar& registrar) const;
+  // {"BNBundleIdentifier": B} for the first busy instance of the plug-in's
+  // bundle that names its bundle, or none.
+  std::optional<tn::Value> checkBusy(const BusyInstanceSource& busyInstances) const;
 
   // A copy of `dictionary` without the keys that begin with "DT".
   static tn::Dictionary prunedInfoDictionaryFor(const tn::Dictionary& dictionary);

@@ -17,9 +17,9 @@ tn::Value failure(int64_t code, std::string message) {
 
 }  // namespace
 
-tn::Result<std::shared_ptr<Vigil>> Vigil::create(std::shared_ptr<warden::Warden> warden,
+tn::Result<std::shared_ptr<Vigil>> Vigil::create(std::shared_ptr<warden::Warden> warden, PrivilegeTest isPrivileged,
                                                  const std::string& serviceName) {
-  std::shared_ptr<Vigil> vigil(new Vigil(std::move(warden)));
+  std::shared_ptr<Vigil> vigil(new Vigil(std::move(warden), std::move(isPrivileged)));
   auto listener = relay::Listener::create(serviceName, tn::dispatch::SerialQueue::create("vigil.listener"));
   if (!listener.ok()) return listener.error();
   vigil->listener_ = std::move(*listener);
@@ -45,18 +45,33 @@ void Vigil::accept(const std::shared_ptr<relay::Connection>& connection) {
     if (event.kind == relay::Event::Kind::ConnectionInvalid) return self->connectionEnded(key);
     const auto live = weakConnection.lock();
     if (!live || event.kind != relay::Event::Kind::Message) return;
-    const std::string* type = event.message.body["request"].string();
-    tn::Value reply = tn::Dictionary{};
-    if (type == nullptr || (*type != "busy" && *type != "idle")) {
-      reply = failure(EINVAL, "the request is neither \"busy\" nor \"idle\"");
-    } else {
-      const relay::AuditToken token = live->auditToken();
-      const tn::Result<void> declared = self->declare(key, token.pid, token.startTime, *type == "busy");
-      if (!declared.ok()) reply = failure(declared.error().code(), declared.error().localizedDescription());
-    }
-    live->sendReply(event.message, std::move(reply));
+    live->sendReply(event.message, self->answer(key, *live, event.message.body));
   });
   connection->resume();
+}
+
+tn::Value Vigil::answer(const void* key, const relay::Connection& connection, const tn::Value& request) {
+  const std::string* type = request["request"].string();
+  if (type != nullptr && (*type == "busy" || *type == "idle")) {
+    const relay::AuditToken token = connection.auditToken();
+    const tn::Result<void> declared = declare(key, token.pid, token.startTime, *type == "busy");
+    if (!declared.ok()) return failure(declared.error().code(), declared.error().localizedDescription());
+    return tn::Dictionary{};
+  }
+  if (type == nullptr || *type != "busy-instances") {
+    return failure(EINVAL, "the request is none of \"busy\", \"idle\", \"busy-instances\"");
+  }
+  if (!isPrivileged_ || !isPrivileged_(connection.peerIdentity())) {
+    return failure(EPERM, "only privileged users may list busy instances");
+  }
+  const tn::Array* identifiers = request["identifiers"].array();
+  if (identifiers == nullptr) return failure(EINVAL, "\"identifiers\" is not an array");
+  std::set<std::string> wanted;
+  for (const tn::Value& identifier : *identifiers) {
+    if (const std::string* text = identifier.string()) wanted.insert(*text);
+  }
+  std::vector<tn::Value> busy = busyInstances(wanted);
+  return tn::Dictionary{{"instances", tn::Array(busy.begin(), busy.end())}};
 }
 
 tn::Result<void> Vigil::declare(const void* key, pid_t pid, uint64_t startTime, bool busy) {

@@ -7,6 +7,9 @@
 //
 //   {"request": "busy"}  -> {}      the instance is working; don't stop it
 //   {"request": "idle"}  -> {}      it may be stopped again
+//   {"request": "busy-instances", "identifiers": ["com.example.a", ...]}
+//                        -> {"instances": [...]}, as busyInstances(); only
+//                           for privileged peers (the daemon's rule)
 //   failures: {"errorcode": <errno number>, "error": "<why>"}
 //
 // The service knows the instance by its connection's peer (pid, start time,
@@ -29,6 +32,7 @@
 #include <sys/types.h>
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -51,7 +55,10 @@ class Vigil : public std::enable_shared_from_this<Vigil> {
  public:
   // Listens as `serviceName`, resumed at once, and checks instances with
   // `warden`. Errors: those of relay::Listener::create.
+  using PrivilegeTest = std::function<bool(const relay::PeerIdentity&)>;
+
   static tn::Result<std::shared_ptr<Vigil>> create(std::shared_ptr<warden::Warden> warden,
+                                                   PrivilegeTest isPrivileged,
                                                    const std::string& serviceName = kVigilServiceName);
   ~Vigil();
   Vigil(const Vigil&) = delete;
@@ -69,8 +76,10 @@ class Vigil : public std::enable_shared_from_this<Vigil> {
   void connectionEnded(const void* key);
 
  private:
-  explicit Vigil(std::shared_ptr<warden::Warden> warden) : warden_(std::move(warden)) {}
+  Vigil(std::shared_ptr<warden::Warden> warden, PrivilegeTest isPrivileged)
+      : warden_(std::move(warden)), isPrivileged_(std::move(isPrivileged)) {}
   void accept(const std::shared_ptr<relay::Connection>& connection);
+  tn::Value answer(const void* key, const relay::Connection& connection, const tn::Value& request);
 
   struct Assertion {
     warden::InstanceInfo instance;
@@ -78,6 +87,7 @@ class Vigil : public std::enable_shared_from_this<Vigil> {
   };
 
   const std::shared_ptr<warden::Warden> warden_;
+  const PrivilegeTest isPrivileged_;
   std::shared_ptr<relay::Listener> listener_;
   mutable std::mutex mutex_;
   std::map<const void*, Assertion> busy_;  // guarded by mutex_: by connection

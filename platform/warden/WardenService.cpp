@@ -1,6 +1,10 @@
 #include "platform/warden/WardenService.h"
 
+#include <unistd.h>
+
 #include <cerrno>
+#include <cstdlib>
+#include <string_view>
 
 #include <fmt/format.h>
 
@@ -16,6 +20,27 @@ tn::Value failure(int64_t code, std::string message) {
 
 tn::Value failure(const tn::Error& error) {
   return failure(error.code() > 0 ? error.code() : EINVAL, error.localizedDescription());
+}
+
+bool testHooksEnabled() {
+  const char* value = std::getenv("TENON_WARDEN_TEST_HOOKS");
+  return value != nullptr && std::string_view(value) == "1";
+}
+
+tn::Value registerForTest(Warden& warden, const relay::PeerIdentity& peer, const tn::Value& request) {
+  if (peer.auditToken.uid != 0 && peer.auditToken.uid != ::geteuid()) {
+    return failure(EPERM, "only root or the supervisor's user may register");
+  }
+  const std::optional<int64_t> host = request["host"].int64();
+  const std::string* executable = request["executable"].string();
+  if (!host || *host <= 0 || executable == nullptr) {
+    return failure(EINVAL, "\"register\" needs \"host\" (a pid) and \"executable\" (a path)");
+  }
+  tn::Result<ProcessHandle> process = ProcessHandle::open(static_cast<pid_t>(*host));
+  if (!process.ok()) return failure(process.error());
+  tn::Result<void> registered = warden.registerExternalService(*process, *executable, request["overlay"]);
+  if (!registered.ok()) return failure(registered.error());
+  return tn::Dictionary{};
 }
 
 }  // namespace
@@ -71,6 +96,7 @@ tn::Value WardenService::answer(Warden& warden, const PrivilegeTest& isPrivilege
     return warden.listing(everything ? std::nullopt
                                        : std::optional<std::pair<pid_t, uint64_t>>({token.pid, token.startTime}));
   }
+  if (*type == "register" && testHooksEnabled()) return registerForTest(warden, peer, request);
   if (*type != "start") return failure(EINVAL, fmt::format("unknown request \"{}\"", *type));
   const std::string* plugIn = request["plug-in"].string();
   if (plugIn == nullptr || plugIn->empty()) return failure(EINVAL, "\"plug-in\" is not a non-empty string");

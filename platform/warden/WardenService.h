@@ -9,6 +9,14 @@
 //        privileged user, the caller's own otherwise
 //   failures: {"errorcode": <errno number>, "error": "<why>"}
 //
+// For tests only, and only when the supervisor's process was started with
+// TENON_WARDEN_TEST_HOOKS=1 in its environment: a peer running as root or
+// as the supervisor's own user may register directly, as the daemon does
+// when a host readies plug-ins:
+//   {"request": "register", "host": <pid>, "executable": "/...", "overlay": {...}}
+//     -> {} or a failure
+// Without the variable the request is unknown, whoever asks.
+//
 // The caller is who the relay identified when it connected (SO_PEERCRED
 // and its pidfd): a host can start only what was registered for that very
 // process. Requests bring no descriptors (the listener refuses any).

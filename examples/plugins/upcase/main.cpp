@@ -4,6 +4,7 @@
 //
 //   any text        the text in upper case (the plug-in is busy meanwhile)
 //   whoami          "uid=<uid> filters=<seccomp filters>"
+//   env             its environment, entries separated by spaces, sorted
 //   write <path>    "ok" when it could create <path>, else "refused <reason>"
 //   hold / release  declares itself busy / idle until told otherwise
 //
@@ -12,12 +13,14 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cctype>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
 #include <fstream>
 #include <string>
+#include <vector>
 
 #include "libtenon/client/TNPlugInInstance.h"
 
@@ -38,6 +41,15 @@ std::string tryWrite(const std::string& path) {
   return "ok";
 }
 
+std::string environmentText() {
+  std::vector<std::string> entries;
+  for (char** entry = environ; *entry != nullptr; ++entry) entries.emplace_back(*entry);
+  std::sort(entries.begin(), entries.end());
+  std::string text;
+  for (const std::string& entry : entries) text += (text.empty() ? "" : " ") + entry;
+  return text;
+}
+
 std::string upperCase(std::string text) {
   for (char& c : text) c = static_cast<char>(std::toupper(static_cast<unsigned char>(c)));
   return text;
@@ -46,6 +58,7 @@ std::string upperCase(std::string text) {
 std::string answer(tn::TNPlugInInstance& instance, const std::string& line) {
   if (line == "whoami") return "uid=" + std::to_string(::getuid()) + " filters=" + seccompFilters();
   if (line.rfind("write ", 0) == 0) return tryWrite(line.substr(6));
+  if (line == "env") return environmentText();
   if (line == "hold") {
     const tn::Result<void> declared = instance.declareBusy();
     return declared.ok() ? "busy" : "busy-failed " + declared.error().localizedDescription();

@@ -228,6 +228,12 @@ TEST_F(WardenTest, HostsStartOnlyWhatWasRegisteredForThemAndRegistrationsEndWith
   const tn::Value listed = ask("com.ostrel.tenon.warden", tn::Dictionary{{"request", "list"}})["registrations"];
   ASSERT_TRUE(listed.array() && listed.array()->size() == 1) << listed;
   EXPECT_EQ((*listed.array())[0]["host"], tn::Value(host.pid()));
+  const auto shown = tn::test::runProcess({TENON_BINARY_DIR "/tools/tnctl/tnctl", "warden", "list"},
+                                          daemon_.environment());
+  EXPECT_EQ(shown.exitStatus, 0) << shown.err;
+  EXPECT_NE(shown.out.find("registrations: 1\n  host " + std::to_string(host.pid()) + "  com.example.upcase 1.0"),
+            std::string::npos)
+      << shown.out;
 
   EXPECT_EQ(host.command("exit"), "bye");
   host.finish();

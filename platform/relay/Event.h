@@ -35,7 +35,7 @@ struct Message {
   // The descriptors that came with the frame (Descriptors.h), or null when
   // it brought none. Copies of the message share them; whoever keeps them
   // moves them out, and what is left is closed with the last copy.
-  std::shared_ptr<Descriptors> descriptors;
+  std::shared_ptr<Descriptors> descriptors = nullptr;
 };
 
 // What a reply handler receives: the reply's body (a dictionary), or a

@@ -45,7 +45,7 @@ struct RawFrame {
   uint64_t id = 0;
   uint64_t replyTo = 0;  // 0 for a request
   tn::Bytes body;
-  Descriptors descriptors;  // what came with the frame; empty for most
+  Descriptors descriptors = {};  // what came with the frame; empty for most
 };
 
 // Decodes a frame body: one CBOR map filling the bytes. A refusal is a

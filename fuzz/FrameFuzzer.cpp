@@ -11,13 +11,21 @@
 //   - a decoded body is a dictionary;
 //   - a reply is accepted only for an id still awaiting one (ids 1 to 8 are
 //     taken as sent, as a connection's pending replies would hold them),
-//     and only once.
+//     and only once;
+//   - descriptors given with one of the reads (bits 3-4 of the first byte
+//     say how many, up to the reader's limit and one beyond it) reach at
+//     most one frame, and every one of them is closed once the reader and
+//     its frames are gone, whatever the bytes did.
+
+#include <fcntl.h>
+#include <unistd.h>
 
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <optional>
 #include <set>
+#include <utility>
 #include <span>
 #include <vector>
 
@@ -39,9 +47,12 @@ struct Outcome {
 
 // Reads `input` in pieces whose sizes come from `cuts` (cycled), with the
 // reply rule of a connection applied by the sink.
-Outcome readAll(std::span<const uint8_t> input, std::span<const uint8_t> cuts) {
+// With `descriptors`, they come with the read whose index is its first.
+Outcome readAll(std::span<const uint8_t> input, std::span<const uint8_t> cuts,
+                std::pair<std::size_t, relay::Descriptors>* descriptors = nullptr) {
   Outcome outcome;
   relay::FrameReader reader;
+  reader.setMaxDescriptorsPerFrame(2);
   std::set<uint64_t> awaiting{1, 2, 3, 4, 5, 6, 7, 8};
   const relay::FrameReader::FrameSink sink = [&](relay::RawFrame&& frame) {
     if (frame.replyTo != 0 && awaiting.erase(frame.replyTo) == 0) {
@@ -52,10 +63,12 @@ Outcome readAll(std::span<const uint8_t> input, std::span<const uint8_t> cuts) {
     return true;
   };
   std::size_t cut = 0;
-  while (!input.empty()) {
+  for (std::size_t read = 0; !input.empty(); ++read) {
     std::size_t size = input.size();
     if (!cuts.empty()) size = std::min<std::size_t>(input.size(), 1 + cuts[cut++ % cuts.size()]);
-    if (!reader.consume(input.first(size), sink).ok()) {
+    relay::Descriptors arriving;
+    if (descriptors != nullptr && descriptors->first == read) arriving = std::move(descriptors->second);
+    if (!reader.consume(input.first(size), std::move(arriving), sink).ok()) {
       outcome.failed = true;
       break;
     }
@@ -72,6 +85,31 @@ void checkFrames(const Outcome& outcome) {
     if (frame.body.size() > relay::kMaxBodySize) fail("body beyond the frame limit");
     tn::Result<tn::Value> body = relay::decodeFrameBody(frame.body);
     if (body.ok() && !body->isDictionary()) fail("decoded body is not a dictionary");
+  }
+}
+
+// Runs the reader with descriptors at one read and checks that none leaks.
+void checkDescriptors(std::span<const uint8_t> stream, std::span<const uint8_t> cuts, uint8_t choice) {
+  const std::size_t count = 1 + ((choice >> 3) & 3u) % 3;  // 1 to 3, against a limit of 2
+  std::pair<std::size_t, relay::Descriptors> descriptors;
+  descriptors.first = (choice >> 5) & 3u;
+  std::vector<int> numbers;
+  for (std::size_t i = 0; i < count; ++i) {
+    descriptors.second.emplace_back(::open("/dev/null", O_RDONLY | O_CLOEXEC));
+    numbers.push_back(descriptors.second.back().get());
+  }
+  {
+    const Outcome outcome = readAll(stream, cuts, &descriptors);
+    std::size_t delivered = 0;
+    for (const relay::RawFrame& frame : outcome.frames) {
+      if (!frame.descriptors.empty()) ++delivered;
+      if (frame.descriptors.size() > 2) fail("a frame got more descriptors than the limit");
+    }
+    if (delivered > 1) fail("descriptors of one read reached two frames");
+  }
+  descriptors.second.clear();
+  for (const int fd : numbers) {
+    if (::fcntl(fd, F_GETFD) != -1) fail("a descriptor was leaked");
   }
 }
 
@@ -94,5 +132,6 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     const relay::RawFrame& b = whole.frames[i];
     if (a.id != b.id || a.replyTo != b.replyTo || a.body != b.body) fail("frame differs with split points");
   }
+  checkDescriptors(stream, cuts, data[0]);
   return 0;
 }

@@ -156,6 +156,42 @@ class Client:
         return b"".join(chunks)
 
 
+VIGIL_SERVICE = "com.ostrel.tenon.vigil"
+
+
+class PlugInInstance:
+    """What a plug-in program started by the supervisor says about itself:
+    busy while it works, idle again after. The busy-assertion service knows
+    the instance by its process; an assertion ends with declare_idle(),
+    close() or the process's exit."""
+
+    def __init__(self, timeout=10.0):
+        self._client = Client(VIGIL_SERVICE, timeout)
+
+    @staticmethod
+    def host_socket():
+        """The socket the host talks to this plug-in on, from
+        TENON_PLUGIN_SOCKET; None when the variable names no descriptor."""
+        text = os.environ.get("TENON_PLUGIN_SOCKET", "")
+        if not text.isdigit():
+            return None
+        return socket.socket(fileno=int(text))
+
+    def declare_busy(self):
+        self._declare("busy")
+
+    def declare_idle(self):
+        self._declare("idle")
+
+    def close(self):
+        self._client.close()
+
+    def _declare(self, request):
+        reply = self._client.request({"request": request})
+        if "errorcode" in reply:
+            raise ProtocolError(f"vigil refused {request}: {reply.get('error')}")
+
+
 def to_json(value):
     """JSON for values JSON lacks: UUIDs and dates as text, data as base64."""
     def fallback(item):

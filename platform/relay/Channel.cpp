@@ -3,6 +3,9 @@
 #include <sys/socket.h>
 #include <string.h>
 
+#include <cstring>
+
+#include <algorithm>
 #include <array>
 #include <asio/post.hpp>
 #include <cerrno>
@@ -44,14 +47,16 @@ Channel::Channel(UniqueFd socket, Callbacks callbacks, std::shared_ptr<void> lea
       socket_(ioContext(), socket.release()),
       callbacks_(std::move(callbacks)),
       budget_(limits),
-      lease_(std::move(lease)) {}
+      lease_(std::move(lease)) {
+  reader_.setMaxDescriptorsPerFrame(std::min(limits.descriptorsPerFrame, kMaxDescriptorsPerFrame));
+}
 
 Channel::~Channel() {
   // Normally the I/O thread closed the channel and failed its requests. A
   // channel dropped without a close still owes its handlers an answer.
   for (PendingReply& pending : pending_.takeAll()) {
     pending.queue->async([handler = std::move(pending.handler)] {
-      handler(makeRelayError(RelayErrorCode::ConnectionInvalid, "the connection was released"));
+      handler(makeRelayError(RelayErrorCode::ConnectionInvalid, "the connection was released"), {});
     });
   }
 }
@@ -64,12 +69,13 @@ void Channel::start() {
   });
 }
 
-bool Channel::send(tn::Bytes frame, PendingReply* pending, std::shared_ptr<const void> whenSent) {
+bool Channel::send(tn::Bytes frame, PendingReply* pending, std::shared_ptr<const void> whenSent,
+                   Descriptors descriptors) {
   const std::lock_guard lock(mutex_);
   if (closing_ || closed_) return false;
   setFrameId(frame, ++lastSentId_);
   if (pending != nullptr) pending_.add(lastSentId_, std::move(*pending));
-  outgoing_.append(std::move(frame), 0, std::move(whenSent));
+  outgoing_.append(std::move(frame), 0, std::move(whenSent), std::move(descriptors));
   if (writeArmed_) {
     // The I/O thread is waiting to write what is queued ahead; keep order.
     if (outgoing_.size() > kMaxOutgoingBytes) {
@@ -135,12 +141,22 @@ void Channel::onReadable() {
   static std::array<uint8_t, kReadChunk> buffer;
   const FrameReader::FrameSink sink = [this](RawFrame&& frame) { return dispatch(std::move(frame)); };
   for (int turn = 0; turn < kReadsPerTurn; ++turn) {
-    const ssize_t n = ::recv(fd_, buffer.data(), buffer.size(), MSG_DONTWAIT);
+    Descriptors descriptors;
+    bool truncated = false;
+    const ssize_t n = receive(buffer, descriptors, truncated);
+    if (truncated) {
+      return closeNow(CloseCause::ProtocolViolation,
+                      fmt::format("a frame brought more than {} descriptors", kMaxDescriptorsPerFrame));
+    }
     if (n > 0) {
-      const tn::Result<void> read = reader_.consume(std::span(buffer.data(), static_cast<std::size_t>(n)), sink);
+      const bool broughtDescriptors = !descriptors.empty();
+      const tn::Result<void> read = reader_.consume(std::span(buffer.data(), static_cast<std::size_t>(n)),
+                                                    std::move(descriptors), sink);
       if (!read.ok()) return closeNow(CloseCause::ProtocolViolation, read.error().message().value_or(""));
       if (closedOnIoThread_) return;  // the sink found a violation
-      if (static_cast<std::size_t>(n) < buffer.size() || budget_.exhausted()) break;
+      // The kernel ends a read after bytes that brought descriptors.
+      const bool cutShort = static_cast<std::size_t>(n) < buffer.size() && !broughtDescriptors;
+      if (cutShort || budget_.exhausted()) break;
       continue;
     }
     if (n == 0) return closeNow(CloseCause::PeerClosed, "the peer closed the connection");
@@ -149,6 +165,33 @@ void Channel::onReadable() {
     return closeNow(CloseCause::PeerClosed, describeErrno("read", errno));
   }
   continueReading();
+}
+
+ssize_t Channel::receive(std::span<uint8_t> buffer, Descriptors& descriptors, bool& truncated) {
+  // Room for one more than a frame may carry, so that a peer sending more
+  // is seen as such whatever the kernel's rounding.
+  alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int) * (kMaxDescriptorsPerFrame + 1))> control{};
+  iovec piece{buffer.data(), buffer.size()};
+  msghdr message{};
+  message.msg_iov = &piece;
+  message.msg_iovlen = 1;
+  message.msg_control = control.data();
+  message.msg_controllen = control.size();
+  const ssize_t n = ::recvmsg(fd_, &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
+  if (n < 0) return n;
+  // Every descriptor installed is owned at once, so that each path below
+  // closes it.
+  for (cmsghdr* header = CMSG_FIRSTHDR(&message); header != nullptr; header = CMSG_NXTHDR(&message, header)) {
+    if (header->cmsg_level != SOL_SOCKET || header->cmsg_type != SCM_RIGHTS) continue;
+    const std::size_t count = (header->cmsg_len - CMSG_LEN(0)) / sizeof(int);
+    for (std::size_t i = 0; i < count; ++i) {
+      int fd = -1;
+      std::memcpy(&fd, CMSG_DATA(header) + i * sizeof(int), sizeof fd);
+      descriptors.emplace_back(fd);
+    }
+  }
+  truncated = (message.msg_flags & MSG_CTRUNC) != 0 || descriptors.size() > kMaxDescriptorsPerFrame;
+  return n;
 }
 
 void Channel::continueReading() {
@@ -197,14 +240,16 @@ bool Channel::dispatch(RawFrame frame) {
 void Channel::deliverReply(PendingReply pending, RawFrame frame) {
   const std::size_t length = frame.body.size() + kFrameIdsSize;
   budget_.charge(length);
+  // Queued blocks must be copyable; the descriptors ride in a shared box.
+  auto descriptors = std::make_shared<Descriptors>(std::move(frame.descriptors));
   pending.queue->async([self = shared_from_this(), handler = std::move(pending.handler),
-                        body = std::move(frame.body), length] {
+                        body = std::move(frame.body), descriptors, length] {
     tn::Result<tn::Value> reply = decodeFrameBody(body);
     if (reply.ok()) {
-      handler(std::move(reply));
+      handler(std::move(reply), std::move(*descriptors));
     } else {
       const std::string reason = reply.error().message().value_or("");
-      handler(makeRelayError(RelayErrorCode::ConnectionInvalid, reason));
+      handler(makeRelayError(RelayErrorCode::ConnectionInvalid, reason), {});
       self->close(CloseCause::ProtocolViolation, reason);
     }
     self->handled(length);
@@ -240,6 +285,19 @@ int Channel::writeQueuedLocked() {
     msghdr message{};
     message.msg_iov = pieces.data();
     message.msg_iovlen = outgoing_.gather(pieces);
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int) * kMaxDescriptorsPerFrame)> control{};
+    if (const Descriptors& passing = outgoing_.descriptorsToSend(); !passing.empty()) {
+      message.msg_control = control.data();
+      message.msg_controllen = CMSG_SPACE(sizeof(int) * passing.size());
+      cmsghdr* header = CMSG_FIRSTHDR(&message);
+      header->cmsg_level = SOL_SOCKET;
+      header->cmsg_type = SCM_RIGHTS;
+      header->cmsg_len = CMSG_LEN(sizeof(int) * passing.size());
+      for (std::size_t i = 0; i < passing.size(); ++i) {
+        const int fd = passing[i].get();
+        std::memcpy(CMSG_DATA(header) + i * sizeof(int), &fd, sizeof fd);
+      }
+    }
     const ssize_t n = ::sendmsg(fd_, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
     if (n >= 0) {
       outgoing_.consume(static_cast<std::size_t>(n));
@@ -274,7 +332,7 @@ void Channel::closeNow(CloseCause cause, const std::string& reason) {
       callbacks_.closed ? callbacks_.closed(self, cause, reason)
                         : makeRelayError(RelayErrorCode::ConnectionInvalid, reason);
   for (PendingReply& pending : orphans) {
-    pending.queue->async([handler = std::move(pending.handler), error] { handler(error); });
+    pending.queue->async([handler = std::move(pending.handler), error] { handler(error, {}); });
   }
 }
 

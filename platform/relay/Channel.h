@@ -78,7 +78,11 @@ class Channel : public std::enable_shared_from_this<Channel> {
   // kernel has taken the whole frame, or the channel closed. Returns false
   // once the channel is closed; then nothing is sent and `pending` is left
   // as it was. Any thread.
-  bool send(tn::Bytes frame, PendingReply* pending = nullptr, std::shared_ptr<const void> whenSent = nullptr);
+  // `descriptors` (at most kMaxDescriptorsPerFrame, checked by the caller)
+  // leave with the frame's first byte; the channel closes its copies once
+  // the kernel took them, or when it closes.
+  bool send(tn::Bytes frame, PendingReply* pending = nullptr, std::shared_ptr<const void> whenSent = nullptr,
+            Descriptors descriptors = {});
 
   // Closes the socket with `cause` unless it is closed already: the
   // callbacks' closed() runs and every pending reply handler receives its
@@ -101,6 +105,10 @@ class Channel : public std::enable_shared_from_this<Channel> {
   // I/O thread.
   void armRead();
   void onReadable();
+  // One recvmsg into `buffer`: the byte count (0 at end of stream, -1 with
+  // errno) and the descriptors that came with the bytes. Sets `truncated`
+  // when the kernel had more descriptors than fit (MSG_CTRUNC).
+  ssize_t receive(std::span<uint8_t> buffer, Descriptors& descriptors, bool& truncated);
   bool dispatch(RawFrame frame);
   // Hands out held requests while the budget allows, then reads on, or
   // pauses until handled() frees enough of the budget.

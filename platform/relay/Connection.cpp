@@ -56,6 +56,18 @@ tn::Result<OpenedSocket> openServiceSocket(std::string_view serviceName) {
   return OpenedSocket{std::move(*socket), std::move(*identity)};
 }
 
+tn::Result<void> checkOutgoingDescriptors(const Descriptors& descriptors) {
+  if (descriptors.size() > kMaxDescriptorsPerFrame) {
+    return makeRelayError(RelayErrorCode::BadDescriptors,
+                          fmt::format("{} descriptors exceed the limit of {} per frame", descriptors.size(),
+                                      kMaxDescriptorsPerFrame));
+  }
+  for (const UniqueFd& fd : descriptors) {
+    if (!fd.valid()) return makeRelayError(RelayErrorCode::BadDescriptors, "an invalid descriptor cannot be sent");
+  }
+  return {};
+}
+
 Event makeEvent(Event::Kind kind, std::string reason) {
   Event event;
   event.kind = kind;
@@ -72,17 +84,19 @@ tn::Result<std::shared_ptr<Connection>> Connection::connectToService(
   auto connection = std::make_shared<Connection>(CreateTag{}, Role::Client, std::move(serviceName),
                                                  std::move(eventQueue), std::move(opened.value().identity));
   connection->channel_ = connection->makeChannel(std::move(opened.value().socket), nullptr,
-                                                 detail::InboundLimits{}.messages);
+                                                 detail::InboundLimits{}.messages, kMaxDescriptorsPerFrame);
   return connection;
 }
 
 std::shared_ptr<Connection> Connection::accepted(UniqueFd socket, PeerIdentity identity, std::string serviceName,
-                                                 std::shared_ptr<void> lease, std::size_t maxOutstandingRequests) {
+                                                 std::shared_ptr<void> lease, std::size_t maxOutstandingRequests,
+                                                 std::size_t descriptorsPerRequest) {
   auto eventQueue = tn::dispatch::SerialQueue::create(
       fmt::format("relay.{}.{}", serviceName, identity.auditToken.pid));
   auto connection = std::make_shared<Connection>(CreateTag{}, Role::Server, std::move(serviceName),
                                                  std::move(eventQueue), std::move(identity));
-  connection->channel_ = connection->makeChannel(std::move(socket), std::move(lease), maxOutstandingRequests);
+  connection->channel_ = connection->makeChannel(std::move(socket), std::move(lease), maxOutstandingRequests,
+                                                 descriptorsPerRequest);
   return connection;
 }
 
@@ -104,12 +118,12 @@ Connection::~Connection() {
 }
 
 std::shared_ptr<Channel> Connection::makeChannel(UniqueFd socket, std::shared_ptr<void> lease,
-                                                std::size_t maxInboundMessages) {
+                                                std::size_t maxInboundMessages, std::size_t descriptorsPerFrame) {
   Channel::Callbacks callbacks;
   const std::weak_ptr<Connection> weak = weak_from_this();
   callbacks.request = [weak](const std::shared_ptr<Channel>& channel, RawFrame frame) {
     if (const auto self = weak.lock()) {
-      self->channelRequest(channel, frame.id, std::move(frame.body));
+      self->channelRequest(channel, frame.id, std::move(frame.body), std::move(frame.descriptors));
     } else {
       channel->handled(frame.body.size() + kFrameIdsSize);
     }
@@ -121,6 +135,7 @@ std::shared_ptr<Channel> Connection::makeChannel(UniqueFd socket, std::shared_pt
   };
   detail::InboundLimits limits;
   limits.messages = maxInboundMessages;
+  limits.descriptorsPerFrame = descriptorsPerFrame;
   return Channel::create(std::move(socket), std::move(callbacks), std::move(lease), limits);
 }
 
@@ -154,29 +169,42 @@ void Connection::cancel() {
   if (channel) channel->close(CloseCause::Cancelled, "the connection was cancelled");
 }
 
-bool Connection::send(tn::Value body) {
+bool Connection::send(tn::Value body) { return send(std::move(body), Descriptors()); }
+
+bool Connection::send(tn::Value body, Descriptors descriptors) {
   tn::Result<tn::Bytes> frame = encodeFrame(body, 0);
+  if (frame.ok()) {
+    if (tn::Result<void> checked = checkOutgoingDescriptors(descriptors); !checked.ok()) frame = checked.error();
+  }
   if (!frame.ok()) {
     TN_LOG_ERROR(tn::log::traffic(), "{}: message not sent: {}", description(), frame.error().description());
     return false;
   }
   tn::Error error;
   const std::shared_ptr<Channel> channel = channelForSending(error);
-  return channel && channel->send(std::move(*frame));
+  return channel && channel->send(std::move(*frame), nullptr, nullptr, std::move(descriptors));
 }
 
 void Connection::sendWithReply(tn::Value body, std::shared_ptr<tn::dispatch::SerialQueue> replyQueue,
                                ReplyHandler handler) {
+  sendWithReply(std::move(body), Descriptors(), std::move(replyQueue),
+                [handler = std::move(handler)](Reply reply, Descriptors) { handler(std::move(reply)); });
+}
+
+void Connection::sendWithReply(tn::Value body, Descriptors descriptors,
+                               std::shared_ptr<tn::dispatch::SerialQueue> replyQueue,
+                               DescriptorReplyHandler handler) {
   const auto fail = [&](tn::Error error) {
-    replyQueue->async([handler = std::move(handler), error = std::move(error)] { handler(error); });
+    replyQueue->async([handler = std::move(handler), error = std::move(error)] { handler(error, {}); });
   };
   tn::Result<tn::Bytes> frame = encodeFrame(body, 0);
   if (!frame.ok()) return fail(frame.error());
+  if (tn::Result<void> checked = checkOutgoingDescriptors(descriptors); !checked.ok()) return fail(checked.error());
   tn::Error error;
   const std::shared_ptr<Channel> channel = channelForSending(error);
   if (!channel) return fail(std::move(error));
   detail::PendingReply pending{replyQueue, std::move(handler)};
-  if (channel->send(std::move(*frame), &pending)) return;
+  if (channel->send(std::move(*frame), &pending, nullptr, std::move(descriptors))) return;
   handler = std::move(pending.handler);
   const std::lock_guard lock(mutex_);
   fail(unusableErrorLocked());
@@ -192,6 +220,11 @@ bool Connection::sendReply(const Message& request, tn::Value reply) {
 }
 
 tn::Result<void> Connection::trySendReply(const Message& request, tn::Value reply) {
+  return trySendReply(request, std::move(reply), Descriptors());
+}
+
+tn::Result<void> Connection::trySendReply(const Message& request, tn::Value reply, Descriptors descriptors) {
+  if (tn::Result<void> checked = checkOutgoingDescriptors(descriptors); !checked.ok()) return checked.error();
   const std::shared_ptr<Channel> channel = request.channel.lock();
   {
     const std::lock_guard lock(mutex_);
@@ -203,7 +236,7 @@ tn::Result<void> Connection::trySendReply(const Message& request, tn::Value repl
   if (!frame.ok()) return frame.error();
   // The request keeps its share of the budget until its reply has left: a
   // peer that does not read its replies stops being read itself.
-  if (!channel->send(std::move(*frame), nullptr, request.charge)) {
+  if (!channel->send(std::move(*frame), nullptr, request.charge, std::move(descriptors))) {
     return makeRelayError(RelayErrorCode::ConnectionInvalid, "the connection closed");
   }
   return {};
@@ -234,7 +267,8 @@ std::shared_ptr<Channel> Connection::reconnect(tn::Error& error) {
     return nullptr;
   }
   std::shared_ptr<Channel> channel =
-      makeChannel(std::move(opened.value().socket), nullptr, detail::InboundLimits{}.messages);
+      makeChannel(std::move(opened.value().socket), nullptr, detail::InboundLimits{}.messages,
+                  kMaxDescriptorsPerFrame);
   bool installed = false;
   bool start = false;
   {
@@ -257,11 +291,14 @@ std::shared_ptr<Channel> Connection::reconnect(tn::Error& error) {
   return channel;
 }
 
-void Connection::channelRequest(const std::shared_ptr<Channel>& channel, uint64_t id, tn::Bytes body) {
+void Connection::channelRequest(const std::shared_ptr<Channel>& channel, uint64_t id, tn::Bytes body,
+                                Descriptors descriptors) {
+  std::shared_ptr<Descriptors> shared;
+  if (!descriptors.empty()) shared = std::make_shared<Descriptors>(std::move(descriptors));
   const std::lock_guard lock(mutex_);
   // Reading starts with resume(), so requests never have to be held.
-  eventQueue_->async([self = shared_from_this(), channel, id, body = std::move(body)] {
-    self->handleRequest(channel, id, body);
+  eventQueue_->async([self = shared_from_this(), channel, id, body = std::move(body), shared] {
+    self->handleRequest(channel, id, body, shared);
   });
 }
 
@@ -309,7 +346,8 @@ void Connection::deliverTerminationImminent() {
   deliverEventLocked(makeEvent(Event::Kind::TerminationImminent, "the process is about to exit"));
 }
 
-void Connection::handleRequest(const std::shared_ptr<Channel>& channel, uint64_t id, const tn::Bytes& body) {
+void Connection::handleRequest(const std::shared_ptr<Channel>& channel, uint64_t id, const tn::Bytes& body,
+                               const std::shared_ptr<Descriptors>& descriptors) {
   // The request holds its share of the budget until its last copy is gone:
   // an owner that keeps it until it has answered limits what a peer can
   // have outstanding (Message::charge).
@@ -324,7 +362,7 @@ void Connection::handleRequest(const std::shared_ptr<Channel>& channel, uint64_t
   } else if (eventHandler_) {
     Event event;
     event.kind = Event::Kind::Message;
-    event.message = Message{id, std::move(*decoded), channel, std::move(charge)};
+    event.message = Message{id, std::move(*decoded), channel, std::move(charge), descriptors};
     eventHandler_(event);
   }
 }

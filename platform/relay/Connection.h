@@ -96,12 +96,22 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // The peer must not reply to it (a reply to a request that awaits none
   // ends the connection).
   bool send(tn::Value body);
+  // The same, passing `descriptors` with the frame (Descriptors.h); false
+  // also for more than kMaxDescriptorsPerFrame or an invalid one. The
+  // connection owns them from here on and closes its copies once sent.
+  bool send(tn::Value body, Descriptors descriptors);
 
   // Sends a request and runs `handler` on `replyQueue` with its reply, or
   // with the error that kept it from coming. The handler runs exactly once,
   // never on the calling thread.
   void sendWithReply(tn::Value body, std::shared_ptr<tn::dispatch::SerialQueue> replyQueue,
                      ReplyHandler handler);
+  // The same, passing `descriptors` with the request, and handing the
+  // handler the descriptors the reply brought. A plain ReplyHandler's
+  // request may also be answered with descriptors: they are closed.
+  // BadDescriptors for more than kMaxDescriptorsPerFrame or an invalid one.
+  void sendWithReply(tn::Value body, Descriptors descriptors,
+                     std::shared_ptr<tn::dispatch::SerialQueue> replyQueue, DescriptorReplyHandler handler);
 
   // Answers `request`, a message this connection delivered. Returns false
   // when nothing was sent: the connection (or, for a client connection, the
@@ -115,6 +125,9 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // fit in a frame: the caller may still answer with something smaller) or
   // NotAMessage.
   tn::Result<void> trySendReply(const Message& request, tn::Value reply);
+  // trySendReply, passing `descriptors` with the reply; BadDescriptors as
+  // for send(). They are closed when nothing was sent.
+  tn::Result<void> trySendReply(const Message& request, tn::Value reply, Descriptors descriptors);
 
   // The peer's identity (for a client connection: the service's, as of the
   // latest connect).
@@ -153,18 +166,21 @@ class Connection : public std::enable_shared_from_this<Connection> {
   // A server connection on an accepted socket; `lease` goes with the socket.
   // At most `maxOutstandingRequests` of its requests are delivered and not
   // yet handled (Message::charge) at any time.
+  // Its requests may bring up to `descriptorsPerRequest` descriptors.
   static std::shared_ptr<Connection> accepted(UniqueFd socket, PeerIdentity identity, std::string serviceName,
-                                              std::shared_ptr<void> lease, std::size_t maxOutstandingRequests);
+                                              std::shared_ptr<void> lease, std::size_t maxOutstandingRequests,
+                                              std::size_t descriptorsPerRequest);
 
   std::shared_ptr<detail::Channel> makeChannel(UniqueFd socket, std::shared_ptr<void> lease,
-                                               std::size_t maxInboundMessages);
+                                               std::size_t maxInboundMessages, std::size_t descriptorsPerFrame);
   // The socket to send on; a client connection that was interrupted
   // connects again. Null when there is none; then `error` says why.
   std::shared_ptr<detail::Channel> channelForSending(tn::Error& error);
   std::shared_ptr<detail::Channel> reconnect(tn::Error& error);
 
   // I/O thread, from the channel.
-  void channelRequest(const std::shared_ptr<detail::Channel>& channel, uint64_t id, tn::Bytes body);
+  void channelRequest(const std::shared_ptr<detail::Channel>& channel, uint64_t id, tn::Bytes body,
+                      Descriptors descriptors);
   tn::Error channelClosed(const std::shared_ptr<detail::Channel>& channel, detail::CloseCause cause,
                           const std::string& reason);
 
@@ -175,7 +191,8 @@ class Connection : public std::enable_shared_from_this<Connection> {
   void deliverTerminationImminent();
 
   // Event queue.
-  void handleRequest(const std::shared_ptr<detail::Channel>& channel, uint64_t id, const tn::Bytes& body);
+  void handleRequest(const std::shared_ptr<detail::Channel>& channel, uint64_t id, const tn::Bytes& body,
+                     const std::shared_ptr<Descriptors>& descriptors);
   void handleEvent(const Event& event);
 
   const Role role_;

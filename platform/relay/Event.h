@@ -7,6 +7,7 @@
 #include <memory>
 #include <string>
 
+#include "platform/relay/Descriptors.h"
 #include "platform/value/Result.h"
 #include "platform/value/Value.h"
 
@@ -31,6 +32,10 @@ struct Message {
   // answered them thereby limits how many a peer can have unanswered, and a
   // peer that does not read its replies stops being read itself.
   std::shared_ptr<const void> charge;
+  // The descriptors that came with the frame (Descriptors.h), or null when
+  // it brought none. Copies of the message share them; whoever keeps them
+  // moves them out, and what is left is closed with the last copy.
+  std::shared_ptr<Descriptors> descriptors = nullptr;
 };
 
 // What a reply handler receives: the reply's body (a dictionary), or a
@@ -38,6 +43,9 @@ struct Message {
 // local refusal of the request (MessageTooLarge, NotAMessage).
 using Reply = tn::Result<tn::Value>;
 using ReplyHandler = std::function<void(Reply)>;
+// A reply handler that also takes the descriptors the reply brought (empty
+// for an error or a reply without any).
+using DescriptorReplyHandler = std::function<void(Reply, Descriptors)>;
 
 struct Event {
   enum class Kind {

@@ -29,22 +29,78 @@ tn::Result<tn::Value> decodeFrameBody(std::span<const uint8_t> body) {
 }
 
 tn::Result<void> FrameReader::consume(std::span<const uint8_t> input, const FrameSink& sink) {
+  return consumeBytes(input, nullptr, sink);
+}
+
+tn::Result<void> FrameReader::consume(std::span<const uint8_t> input, Descriptors descriptors,
+                                      const FrameSink& sink) {
+  if (descriptors.empty()) return consumeBytes(input, nullptr, sink);
+  if (state_ == State::Reading && descriptors.size() > maxDescriptors_) {
+    return fail(violation(fmt::format("a frame brought {} descriptors; this connection accepts at most {}",
+                                      descriptors.size(), maxDescriptors_)));
+  }
+  return consumeBytes(input, &descriptors, sink);
+}
+
+tn::Result<void> FrameReader::consumeBytes(std::span<const uint8_t> input, Descriptors* arriving,
+                                           const FrameSink& sink) {
+  // With descriptors in the read, the last frame completed in it is held
+  // back until it is known whether another frame begins after it.
+  std::optional<RawFrame> lastComplete;
+  bool currentBegunHere = false;  // the frame being assembled began in this read
   while (state_ == State::Reading && !input.empty()) {
     const bool headerWasComplete = headerFill_ == kFrameHeaderSize;
     if (!headerWasComplete) {
+      if (headerFill_ == 0 && arriving != nullptr) {
+        currentBegunHere = true;
+        if (lastComplete) {
+          emit(std::move(*lastComplete), sink);
+          lastComplete.reset();
+          if (state_ != State::Reading) break;
+        }
+      }
       const bool complete = fillHeader(input);
       if (tn::Result<void> length = checkLength(); !length.ok()) return fail(length.error());
       if (!complete) break;
       if (tn::Result<void> header = acceptHeader(); !header.ok()) return fail(header.error());
     }
     if (!fillBody(input)) break;
-    RawFrame frame{lastId_, loadBigEndian64(header_.data() + kFrameLengthSize + 8), std::move(body_)};
+    RawFrame frame{lastId_, loadBigEndian64(header_.data() + kFrameLengthSize + 8), std::move(body_),
+                   std::move(inProgressDescriptors_)};
     body_ = tn::Bytes();
+    inProgressDescriptors_ = Descriptors();
     headerFill_ = 0;
-    if (!sink(std::move(frame))) state_ = State::SinkStopped;
+    if (currentBegunHere) {
+      lastComplete = std::move(frame);
+    } else {
+      emit(std::move(frame), sink);
+    }
+    currentBegunHere = false;
   }
   if (state_ == State::Failed) return failure_;
-  return {};
+  if (arriving == nullptr || state_ == State::SinkStopped) return {};
+  return placeDescriptors(*arriving, lastComplete, currentBegunHere, sink);
+}
+
+tn::Result<void> FrameReader::placeDescriptors(Descriptors& arriving, std::optional<RawFrame>& lastComplete,
+                                               bool frameBegunInProgress, const FrameSink& sink) {
+  if (frameBegunInProgress) {
+    // The frame still arriving began last: the descriptors are its own.
+    if (lastComplete) emit(std::move(*lastComplete), sink);
+    inProgressDescriptors_ = std::move(arriving);
+    return {};
+  }
+  if (lastComplete) {
+    lastComplete->descriptors = std::move(arriving);
+    emit(std::move(*lastComplete), sink);
+    return {};
+  }
+  return fail(violation(fmt::format("{} descriptors arrived in the middle of a frame", arriving.size())));
+}
+
+void FrameReader::emit(RawFrame&& frame, const FrameSink& sink) {
+  if (state_ != State::Reading) return;
+  if (!sink(std::move(frame))) state_ = State::SinkStopped;
 }
 
 bool FrameReader::fillHeader(std::span<const uint8_t>& input) {
@@ -96,6 +152,7 @@ bool FrameReader::fillBody(std::span<const uint8_t>& input) {
 
 tn::Result<void> FrameReader::fail(tn::Error error) {
   state_ = State::Failed;
+  inProgressDescriptors_.clear();
   failure_ = std::move(error);
   return failure_;
 }

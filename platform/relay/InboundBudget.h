@@ -16,11 +16,16 @@
 #include <atomic>
 #include <cstddef>
 
+#include "platform/relay/Descriptors.h"
+
 namespace relay::detail {
 
 struct InboundLimits {
   std::size_t messages = 1024;
   std::size_t bytes = 32u * 1024u * 1024u;
+  // Descriptors one inbound frame may bring (Descriptors.h); more ends the
+  // connection.
+  std::size_t descriptorsPerFrame = kMaxDescriptorsPerFrame;
 };
 
 class InboundBudget {

@@ -123,6 +123,7 @@ struct Listener::Core : std::enable_shared_from_this<Core> {
   const std::shared_ptr<detail::ConnectionLimit> limit =
       std::make_shared<detail::ConnectionLimit>(detail::ConnectionLimits{});
   std::atomic<std::size_t> outstandingRequests{Limits{}.outstandingRequests};
+  std::atomic<std::size_t> descriptorsPerRequest{Limits{}.descriptorsPerRequest};
 
   // Set before resume(), then read on `queue`.
   NewConnectionHandler onConnection;
@@ -204,7 +205,8 @@ struct Listener::Core : std::enable_shared_from_this<Core> {
       return;
     }
     std::shared_ptr<Connection> connection = makeConnection(std::move(socket), std::move(*identity), serviceName,
-                                                            std::move(lease), outstandingRequests.load());
+                                                            std::move(lease), outstandingRequests.load(),
+                                                            descriptorsPerRequest.load());
     TN_LOG_DEBUG(tn::log::traffic(), "{} accepted", connection->description());
     if (onConnection) onConnection(std::move(connection));
   }
@@ -259,10 +261,11 @@ Listener::~Listener() { cancel(); }
 
 std::shared_ptr<Connection> Listener::makeConnection(UniqueFd socket, PeerIdentity identity,
                                                      std::string serviceName, std::shared_ptr<void> lease,
-                                                     std::size_t outstandingRequests) {
+                                                     std::size_t outstandingRequests,
+                                                     std::size_t descriptorsPerRequest) {
   std::shared_ptr<Connection> connection = Connection::accepted(std::move(socket), std::move(identity),
                                                                 std::move(serviceName), std::move(lease),
-                                                                outstandingRequests);
+                                                                outstandingRequests, descriptorsPerRequest);
   if (detail::registerForTermination(connection)) connection->deliverTerminationImminent();
   return connection;
 }
@@ -280,12 +283,13 @@ void Listener::setMaxConnectionsPerUser(std::size_t limit) {
 void Listener::setLimits(const Limits& limits) {
   core_->limit->setLimits({limits.connectionsPerUser, limits.connectionsTotal, limits.privilegedReserve});
   core_->outstandingRequests = std::max<std::size_t>(1, limits.outstandingRequests);
+  core_->descriptorsPerRequest = std::min(limits.descriptorsPerRequest, kMaxDescriptorsPerFrame);
 }
 
 Listener::Limits Listener::limits() const {
   const detail::ConnectionLimits connections = core_->limit->limits();
   return Limits{connections.perUser, connections.total, connections.privilegedReserve,
-                core_->outstandingRequests.load()};
+                core_->outstandingRequests.load(), core_->descriptorsPerRequest.load()};
 }
 
 void Listener::resume() {

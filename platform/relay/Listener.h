@@ -61,6 +61,11 @@ class Listener {
     // Places of the total kept for root and this process's own user.
     std::size_t privilegedReserve = 0;
     std::size_t outstandingRequests = 64;  // per connection
+    // Descriptors one request may bring (Descriptors.h), at most
+    // kMaxDescriptorsPerFrame; a request with more ends its connection. 0:
+    // a service that takes none refuses them all, so no peer can make it
+    // hold descriptors.
+    std::size_t descriptorsPerRequest = 0;
   };
 
   // Binds (or adopts) the socket of `serviceName`; handlers run on `queue`.
@@ -102,7 +107,8 @@ class Listener {
   // befriends Listener, not its Core).
   static std::shared_ptr<Connection> makeConnection(UniqueFd socket, PeerIdentity identity,
                                                     std::string serviceName, std::shared_ptr<void> lease,
-                                                    std::size_t outstandingRequests);
+                                                    std::size_t outstandingRequests,
+                                                    std::size_t descriptorsPerRequest);
 
   std::shared_ptr<Core> core_;
 };

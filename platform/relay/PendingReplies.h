@@ -20,7 +20,7 @@ namespace relay::detail {
 
 struct PendingReply {
   std::shared_ptr<tn::dispatch::SerialQueue> queue;  // where the handler runs
-  ReplyHandler handler;
+  DescriptorReplyHandler handler;
 };
 
 class PendingReplies {

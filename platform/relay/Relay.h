@@ -22,6 +22,8 @@
 //   Connection.h        a conversation: events, send, sendWithReply, sendReply
 //   Event.h             Event, Message, Reply
 //   AuditToken.h        peer identity; PeerIdentity.h adds the executable path
+//   Descriptors.h       descriptors that travel with a frame (SCM_RIGHTS)
+//   PollerWatch.h       a descriptor or a time waited for on the I/O poller
 //   KeepAlive.h         process-wide transaction count
 //   Termination.h       terminationImminent()
 //   SocketActivation.h  takeActivatedSocket(), notifyReady()
@@ -38,12 +40,14 @@
 
 #include "platform/relay/AuditToken.h"
 #include "platform/relay/Connection.h"
+#include "platform/relay/Descriptors.h"
 #include "platform/relay/Event.h"
 #include "platform/relay/Frame.h"
 #include "platform/relay/FrameReader.h"
 #include "platform/relay/KeepAlive.h"
 #include "platform/relay/Listener.h"
 #include "platform/relay/PeerIdentity.h"
+#include "platform/relay/PollerWatch.h"
 #include "platform/relay/RelayError.h"
 #include "platform/relay/ServicePath.h"
 #include "platform/relay/SocketActivation.h"

@@ -27,6 +27,7 @@ enum class RelayErrorCode : int64_t {
   ServiceUnavailable = 7,     // nothing listens on the service's socket
   SystemError = 8,            // a system call failed (the message names it and errno)
   PeerUnidentified = 9,       // the peer's identity could not be established
+  BadDescriptors = 10,        // more than kMaxDescriptorsPerFrame outgoing descriptors, or an invalid one
 };
 
 tn::Error makeRelayError(RelayErrorCode code, std::string message);

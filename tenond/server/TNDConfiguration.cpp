@@ -3,6 +3,7 @@
 #include <grp.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
@@ -127,6 +128,16 @@ TNDConfiguration TNDConfiguration::load() {
     return {};
   }
   return fromDocument(*document, file);
+}
+
+}  // namespace tnd
+
+namespace tnd {
+
+bool TNDConfiguration::isPrivilegedUser(const relay::AuditToken& token) const {
+  if (token.uid == 0 || token.uid == ::geteuid()) return true;
+  return std::any_of(privilegedGroups.begin(), privilegedGroups.end(),
+                     [&](gid_t group) { return token.isMemberOf(group); });
 }
 
 }  // namespace tnd

@@ -24,6 +24,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/relay/AuditToken.h"
 #include "platform/value/Value.h"
 
 namespace tnd {
@@ -47,6 +48,11 @@ struct TNDConfiguration {
 
   // $TENON_ROOT/etc/tenon/tenond.manifest.
   static std::string path();
+
+  // The daemon's one rule for privileged users: uid 0, the daemon's own
+  // uid, or a member (primary or supplementary group, as of connect()) of a
+  // group in "privileged-groups".
+  bool isPrivilegedUser(const relay::AuditToken& token) const;
 };
 
 }  // namespace tnd

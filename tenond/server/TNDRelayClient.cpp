@@ -134,10 +134,7 @@ bool TNDRelayClient::hasEntitlement(const std::string& key) const {
 bool TNDRelayClient::isSandboxed() const { return sandbox::countsAsSandboxed(peer_.seccompFilters); }
 
 bool TNDRelayClient::isPrivilegedUser() const {
-  const relay::AuditToken& token = peer_.auditToken;
-  if (token.uid == 0 || token.uid == ::geteuid()) return true;
-  const std::vector<gid_t>& groups = server_->configuration().privilegedGroups;
-  return std::any_of(groups.begin(), groups.end(), [&](gid_t group) { return token.isMemberOf(group); });
+  return server_->configuration().isPrivilegedUser(peer_.auditToken);
 }
 
 bool TNDRelayClient::mayManage() const { return isPrivilegedUser() && hasEntitlement(kManagerEntitlement); }

@@ -60,8 +60,31 @@ std::shared_ptr<TNDServer> TNDServer::initForService(const std::string& serviceN
     return current ? current->annotationForPlugIn(plugIn) : std::nullopt;
   });
   types::TypeHierarchy::system();
+  server->startPlatformServices();
   server->installListenerHandlers();
   return server;
+}
+
+void TNDServer::startPlatformServices() {
+  warden_ = warden::Warden::create();
+  const TNDConfiguration configuration = configuration_;
+  const auto isPrivileged = [configuration](const relay::PeerIdentity& peer) {
+    return configuration.isPrivilegedUser(peer.auditToken);
+  };
+  auto wardenService = warden::WardenService::create(warden_, isPrivileged);
+  if (wardenService.ok()) {
+    wardenService_ = std::move(*wardenService);
+  } else {
+    TN_LOG_ERROR(tn::log::ops(), "cannot serve {}: {}", warden::kWardenServiceName,
+                 wardenService.error().localizedDescription());
+  }
+  auto busyService = vigil::Vigil::create(warden_, isPrivileged);
+  if (busyService.ok()) {
+    vigil_ = std::move(*busyService);
+  } else {
+    TN_LOG_ERROR(tn::log::ops(), "cannot serve {}: {}", vigil::kVigilServiceName,
+                 busyService.error().localizedDescription());
+  }
 }
 
 std::shared_ptr<TNDServer> TNDServer::server() {

@@ -27,6 +27,9 @@
 #include "platform/dispatch/FairQueue.h"
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/relay/Listener.h"
+#include "platform/vigil/Vigil.h"
+#include "platform/warden/Warden.h"
+#include "platform/warden/WardenService.h"
 #include "tenond/database/TNDUserPrefs.h"
 #include "tenond/database/TNDatabase.h"
 #include "tenond/server/TNDConfiguration.h"
@@ -92,10 +95,23 @@ class TNDServer final : public TNDatabase,
   const TNDConfiguration& configuration() const { return configuration_; }
   const std::shared_ptr<relay::Listener>& service() const { return service_; }
 
+  // The process supervisor (platform/warden) and the busy-assertion service
+  // (platform/vigil), made at start-up. Activation registers plug-ins with
+  // warden()->addExternalService(client's audit token, executable path,
+  // overlay); holds and uninstalls terminate with
+  // warden()->removeExternalService(identifier, version, queue, reply);
+  // checkBusy asks vigil()->busyInstances({identifier}). vigil() is null
+  // when its service name could not be bound (logged at start-up).
+  const std::shared_ptr<warden::Warden>& warden() const { return warden_; }
+  const std::shared_ptr<vigil::Vigil>& vigil() const { return vigil_; }
+
  private:
   TNDServer() = default;
   void installListenerHandlers();
   void postAnnotationChanges(size_t count);
+  // Makes the supervisor and the busy-assertion service and their relay
+  // services; a service name that cannot be bound is logged, not fatal.
+  void startPlatformServices();
 
   std::atomic<uint32_t> verbose_{0};
   std::shared_ptr<tn::dispatch::SerialQueue> relayQueue_;
@@ -104,6 +120,9 @@ class TNDServer final : public TNDatabase,
   std::shared_ptr<tn::dispatch::SerialQueue> syncQueue_;
   std::shared_ptr<relay::Listener> service_;
   std::vector<std::shared_ptr<TNDPlugInHold>> holds_;  // on syncQueue_ only
+  std::shared_ptr<warden::Warden> warden_;
+  std::unique_ptr<warden::WardenService> wardenService_;
+  std::shared_ptr<vigil::Vigil> vigil_;
   TNDUserPrefs userPrefs_;
   TNDConfiguration configuration_;
 };

@@ -74,7 +74,8 @@ pid_t startChild(const std::vector<char*>& argp, const std::vector<char*>& envp,
 }  // namespace
 
 DaemonProcess::DaemonProcess(std::string binary, std::vector<std::string> arguments,
-                             const std::function<void(const std::string& root)>& prepare) {
+                             const std::function<void(const std::string& root)>& prepare,
+                             const std::vector<std::string>& extraEnvironment) {
   root_ = (std::filesystem::temp_directory_path() / ("tenond-test-" + uniqueSuffix())).string();
   std::filesystem::create_directories(root_);
   std::filesystem::permissions(root_, std::filesystem::perms(0755));
@@ -85,6 +86,7 @@ DaemonProcess::DaemonProcess(std::string binary, std::vector<std::string> argume
   std::vector<std::string> argv{std::move(binary), "-S", service_};
   argv.insert(argv.end(), arguments.begin(), arguments.end());
   std::vector<std::string> env = daemonEnvironment(root_);
+  env.insert(env.end(), extraEnvironment.begin(), extraEnvironment.end());
   std::vector<char*> argp = pointersTo(argv);
   std::vector<char*> envp = pointersTo(env);
 

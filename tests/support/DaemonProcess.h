@@ -38,9 +38,11 @@ inline std::string tenondBinaryPath() { return std::string(TENON_BINARY_DIR "/te
 class DaemonProcess {
  public:
   // Starts `binary` (usually tenondBinaryPath()) with "-S <unique service>"
-  // followed by `arguments`, after prepare(root()).
+  // followed by `arguments`, after prepare(root()), with the "NAME=value"
+  // entries of `extraEnvironment` added to its environment.
   explicit DaemonProcess(std::string binary, std::vector<std::string> arguments = {},
-                         const std::function<void(const std::string& root)>& prepare = {});
+                         const std::function<void(const std::string& root)>& prepare = {},
+                         const std::vector<std::string>& extraEnvironment = {});
   ~DaemonProcess();
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;

@@ -41,4 +41,7 @@ void addAnnotationCommands(CLI::App& app, const GlobalOptions& options);    // a
 void addHoldCommands(CLI::App& app, const GlobalOptions& options);          // hold, release
 void addRequestCommand(CLI::App& app, const GlobalOptions& options);        // request (raw)
 
+// The supervisor's own service.
+void addWardenCommands(CLI::App& app, const GlobalOptions& options);  // warden list
+
 }  // namespace tnctl

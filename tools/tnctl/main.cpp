@@ -42,6 +42,7 @@ int main(int argc, char** argv) {
   tnctl::addAnnotationCommands(app, options);
   tnctl::addHoldCommands(app, options);
   tnctl::addRequestCommand(app, options);
+  tnctl::addWardenCommands(app, options);
 
   quietLibraryLogs();
   try {

@@ -170,7 +170,7 @@ std::optional<RawFrame> RawClient::readFrame() {
   uint8_t header[kFrameHeaderSize];
   if (!readExactly(header, sizeof header)) return std::nullopt;
   RawFrame frame{loadBigEndian64(header + 4), loadBigEndian64(header + 12),
-                 tn::Bytes(loadBigEndian32(header) - kFrameIdsSize)};
+                 tn::Bytes(loadBigEndian32(header) - kFrameIdsSize), {}};
   if (!readExactly(frame.body.data(), frame.body.size())) return std::nullopt;
   return frame;
 }

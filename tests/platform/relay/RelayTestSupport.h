@@ -142,6 +142,7 @@ class RawClient {
   // True when the peer closes within kPatience (frames before are skipped).
   bool waitForClose();
   void close() { fd_.reset(); }
+  int fd() const { return fd_.get(); }
 
  private:
   bool readExactly(uint8_t* out, std::size_t size);

@@ -1,0 +1,251 @@
+// The supervisor in the real tenond: a host process (warden_host) starts the
+// example plug-in (upcase) through the supervisor's service and talks to it
+// over the socket it got in the reply. The registration is made through the
+// service's test-only "register" request, as the daemon makes it when a host
+// readies plug-ins. When the test runs as root, the host runs as uid 65534.
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <future>
+#include <memory>
+#include <optional>
+#include <string>
+#include <thread>
+
+#include "platform/dispatch/SerialQueue.h"
+#include "platform/relay/Connection.h"
+#include "platform/sandbox/SandboxCheck.h"
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/Subprocess.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using tn::test::ChildProcess;
+using tn::test::DaemonProcess;
+
+constexpr uid_t kNobody = 65534;
+constexpr const char* kPlugIn = "com.example.upcase";
+
+void install(const fs::path& from, const fs::path& to, fs::perms mode) {
+  fs::create_directories(to.parent_path());
+  fs::copy_file(from, to, fs::copy_options::overwrite_existing);
+  fs::permissions(to, mode);
+}
+
+// What the daemon's root needs: the profiles, the example bundle, and the
+// plug-in's data container, owned by the user the plug-in will run as.
+void prepareRoot(const std::string& root, uid_t hostUid) {
+  for (const auto& profile : fs::directory_iterator(TENON_SOURCE_DIR "/packaging/sandbox-profiles")) {
+    install(profile.path(), fs::path(root) / "usr/share/tenon/sandbox-profiles" / profile.path().filename(),
+            fs::perms(0644));
+  }
+  const fs::path bundle = fs::path(root) / "opt/plugins/Upcase.bundle";
+  install(TENON_SOURCE_DIR "/examples/plugins/Upcase.bundle/Info.manifest", bundle / "Info.manifest", fs::perms(0644));
+  install(TENON_BINARY_DIR "/examples/plugins/upcase/upcase", bundle / "bin/upcase", fs::perms(0755));
+  const fs::path container = fs::path(root) / "var/lib/tenon/containers" / kPlugIn;
+  fs::create_directories(container);
+  for (fs::path at = root; at != container;) {  // every level traversable
+    fs::permissions(at, fs::perms(0755));
+    at /= container.lexically_relative(at).begin()->string();
+  }
+  ASSERT_EQ(::chown(container.c_str(), hostUid, hostUid), 0);
+  fs::permissions(container, fs::perms(0700));
+}
+
+tn::Value overlay() {
+  return tn::Dictionary{
+      {"RelayService", tn::Dictionary{{"EnvironmentVariables", tn::Dictionary{{"GREETING", "hello"}}},
+                                      {"_SandboxProfile", "plugin"},
+                                      {"_OmitSandboxParameters", true}}},
+      {"BNBundlePackageType", "RLY!"}};
+}
+
+// One request to a service of the daemon's root, answered within 20 s.
+tn::Value ask(const std::string& service, tn::Value request) {
+  auto queue = tn::dispatch::SerialQueue::create("test.ask");
+  auto connection = relay::Connection::connectToService(service, queue);
+  if (!connection.ok()) return tn::Dictionary{{"error", connection.error().description()}};
+  (*connection)->setEventHandler([](const relay::Event&) {});
+  (*connection)->resume();
+  auto promise = std::make_shared<std::promise<relay::Reply>>();
+  (*connection)->sendWithReply(std::move(request), queue, [promise](relay::Reply reply) { promise->set_value(reply); });
+  auto future = promise->get_future();
+  if (future.wait_for(std::chrono::seconds(20)) != std::future_status::ready) return tn::Dictionary{{"error", "no reply"}};
+  relay::Reply reply = future.get();
+  (*connection)->cancel();
+  return reply.ok() ? *reply : tn::Dictionary{{"error", reply.error().description()}};
+}
+
+// The host process and the two FIFOs the test drives it through.
+class Host {
+ public:
+  Host(const std::string& root, uid_t uid) : commands_(root + "/host-commands"), answers_(root + "/host-answers") {
+    ::mkfifo(commands_.c_str(), 0666);
+    ::mkfifo(answers_.c_str(), 0666);
+    ::chmod(commands_.c_str(), 0666);
+    ::chmod(answers_.c_str(), 0666);
+    // Both ends held here, so no open blocks whatever the host does.
+    commandFd_ = ::open(commands_.c_str(), O_RDWR | O_CLOEXEC);
+    answerFd_ = ::open(answers_.c_str(), O_RDWR | O_CLOEXEC);
+    const bool drop = ::geteuid() == 0;
+    child_ = std::make_unique<ChildProcess>(
+        std::vector<std::string>{TENON_BINARY_DIR "/tests/e2e/warden_host", commands_, answers_},
+        std::vector<std::string>{"TENON_ROOT=" + root}, [drop, uid] {
+          if (!drop) return true;
+          return ::syscall(SYS_setgroups, 0, nullptr) == 0 && ::syscall(SYS_setresgid, uid, uid, uid) == 0 &&
+                 ::syscall(SYS_setresuid, uid, uid, uid) == 0;
+        });
+  }
+  ~Host() {
+    if (child_->pid() > 0) command("exit");
+    child_.reset();
+    ::close(commandFd_);
+    ::close(answerFd_);
+  }
+
+  pid_t pid() const { return child_->pid(); }
+
+  // Sends one command and returns its answer line ("" after 20 s).
+  std::string command(const std::string& line) {
+    const std::string text = line + "\n";
+    if (::write(commandFd_, text.data(), text.size()) != static_cast<ssize_t>(text.size())) return "";
+    std::string answer;
+    for (char c = 0;;) {
+      pollfd ready{answerFd_, POLLIN, 0};
+      if (::poll(&ready, 1, 20000) != 1 || ::read(answerFd_, &c, 1) != 1) return "";
+      if (c == '\n') return answer;
+      answer.push_back(c);
+    }
+  }
+
+  tn::test::ProcessResult finish() { return child_->finish(); }
+
+ private:
+  std::string commands_;
+  std::string answers_;
+  int commandFd_ = -1;
+  int answerFd_ = -1;
+  std::unique_ptr<ChildProcess> child_;
+};
+
+class WardenTest : public ::testing::Test {
+ protected:
+  WardenTest()
+      : hostUid_(::geteuid() == 0 ? kNobody : ::geteuid()),
+        daemon_(tn::test::tenondBinaryPath(), {}, [this](const std::string& root) { prepareRoot(root, hostUid_); },
+                {"TENON_WARDEN_TEST_HOOKS=1"}) {
+    ::setenv("TENON_ROOT", daemon_.root().c_str(), 1);
+  }
+  ~WardenTest() override { ::unsetenv("TENON_ROOT"); }
+
+  std::string executable() const { return daemon_.root() + "/opt/plugins/Upcase.bundle/bin/upcase"; }
+  std::string container() const { return daemon_.root() + "/var/lib/tenon/containers/" + kPlugIn; }
+
+  tn::Value registerFor(pid_t host) {
+    return ask("com.ostrel.tenon.warden", tn::Dictionary{{"request", "register"},
+                                                         {"host", host},
+                                                         {"executable", executable()},
+                                                         {"overlay", overlay()}});
+  }
+
+  tn::Value busy() {
+    return ask("com.ostrel.tenon.vigil",
+               tn::Dictionary{{"request", "busy-instances"}, {"identifiers", tn::Array{tn::Value(kPlugIn)}}});
+  }
+
+  const uid_t hostUid_;
+  DaemonProcess daemon_;
+};
+
+pid_t startedPid(const std::string& answer) {
+  return answer.rfind("started ", 0) == 0 ? static_cast<pid_t>(std::stoi(answer.substr(8))) : 0;
+}
+
+TEST_F(WardenTest, StartedPlugInAnswersAsTheHostsUserInItsSandbox) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  Host host(daemon_.root(), hostUid_);
+  ASSERT_EQ(registerFor(host.pid()), tn::Value(tn::Dictionary{})) << daemon_.log();
+
+  const pid_t plugIn = startedPid(host.command(std::string("start ") + kPlugIn));
+  ASSERT_GT(plugIn, 0) << daemon_.log();
+  EXPECT_EQ(host.command("send make this loud"), "MAKE THIS LOUD");
+  EXPECT_EQ(host.command("send whoami").substr(0, 4 + std::to_string(hostUid_).size()),
+            "uid=" + std::to_string(hostUid_));
+  // The daemon's own test sees it as sandboxed.
+  EXPECT_TRUE(sandbox::isProcessSandboxed(plugIn));
+  // Exactly the overlay's environment, with the socket and the root added.
+  EXPECT_EQ(host.command("send env"),
+            "GREETING=hello TENON_PLUGIN_SOCKET=3 TENON_ROOT=" + daemon_.root());
+  EXPECT_EQ(host.command("send write " + container() + "/note"), "ok");
+}
+
+TEST_F(WardenTest, StartedPlugInCannotWriteOutsideItsContainer) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  const long abi = ::syscall(SYS_landlock_create_ruleset, nullptr, 0, 1U);
+  if (abi <= 0) GTEST_SKIP() << "this kernel has no Landlock; plug-ins are confined by seccomp only";
+  // A directory the host's user may write to, so that only the sandbox stops it.
+  const std::string open = daemon_.root() + "/open";
+  fs::create_directories(open);
+  fs::permissions(open, fs::perms(0777));
+  Host host(daemon_.root(), hostUid_);
+  ASSERT_EQ(registerFor(host.pid()), tn::Value(tn::Dictionary{}));
+  ASSERT_GT(startedPid(host.command(std::string("start ") + kPlugIn)), 0) << daemon_.log();
+  EXPECT_EQ(host.command("send write " + open + "/escape").rfind("refused", 0), 0u);
+  EXPECT_FALSE(fs::exists(open + "/escape"));
+}
+
+TEST_F(WardenTest, BusyDeclarationsAreSeenUntilTheInstanceIsIdle) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  Host host(daemon_.root(), hostUid_);
+  ASSERT_EQ(registerFor(host.pid()), tn::Value(tn::Dictionary{}));
+  const pid_t plugIn = startedPid(host.command(std::string("start ") + kPlugIn));
+  ASSERT_GT(plugIn, 0) << daemon_.log();
+  EXPECT_EQ(busy()["instances"], tn::Value(tn::Array{}));
+  ASSERT_EQ(host.command("send hold"), "busy") << daemon_.log();
+  const tn::Value busyNow = busy()["instances"];
+  ASSERT_TRUE(busyNow.array() && busyNow.array()->size() == 1) << busyNow;
+  EXPECT_EQ((*busyNow.array())[0]["BNBundleIdentifier"], tn::Value(kPlugIn));
+  EXPECT_EQ((*busyNow.array())[0]["pid"], tn::Value(plugIn));
+  ASSERT_EQ(host.command("send release"), "idle");
+  EXPECT_EQ(busy()["instances"], tn::Value(tn::Array{}));
+}
+
+TEST_F(WardenTest, HostsStartOnlyWhatWasRegisteredForThemAndRegistrationsEndWithThem) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  Host host(daemon_.root(), hostUid_);
+  EXPECT_EQ(host.command(std::string("start ") + kPlugIn).rfind("error 1 no plug-in", 0), 0u);
+  ASSERT_EQ(registerFor(host.pid()), tn::Value(tn::Dictionary{}));
+  EXPECT_EQ(host.command("start /bin/sh").rfind("error 1 ", 0), 0u);  // not registered: never run
+  const tn::Value listed = ask("com.ostrel.tenon.warden", tn::Dictionary{{"request", "list"}})["registrations"];
+  ASSERT_TRUE(listed.array() && listed.array()->size() == 1) << listed;
+  EXPECT_EQ((*listed.array())[0]["host"], tn::Value(host.pid()));
+  const auto shown = tn::test::runProcess({TENON_BINARY_DIR "/tools/tnctl/tnctl", "warden", "list"},
+                                          daemon_.environment());
+  EXPECT_EQ(shown.exitStatus, 0) << shown.err;
+  EXPECT_NE(shown.out.find("registrations: 1\n  host " + std::to_string(host.pid()) + "  com.example.upcase 1.0"),
+            std::string::npos)
+      << shown.out;
+
+  EXPECT_EQ(host.command("exit"), "bye");
+  host.finish();
+  // The registration goes when the supervisor sees the host's pidfd report
+  // the exit; the daemon logs it.
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+  while (daemon_.log().find("registrations go with it") == std::string::npos &&
+         std::chrono::steady_clock::now() < deadline) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+  }
+  const tn::Value after = ask("com.ostrel.tenon.warden", tn::Dictionary{{"request", "list"}})["registrations"];
+  EXPECT_EQ(after, tn::Value(tn::Array{})) << daemon_.log();
+}
+
+}  // namespace

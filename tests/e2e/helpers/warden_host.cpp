@@ -1,0 +1,90 @@
+// warden_host: a host process for the supervisor's end-to-end tests. It
+// reads commands, one per line, from the FIFO named by its first argument
+// and writes one answer line per command to the FIFO named by its second:
+//
+//   start <plug-in>   asks the supervisor to start it; "started <pid>" or
+//                     "error <code> <message>"; keeps the socket it got
+//   send <line>       writes the line to the plug-in, answers the plug-in's
+//                     answer line ("closed" when it went away)
+//   exit              answers "bye" and exits
+//
+// It uses the relay like any host: TENON_ROOT names the platform root.
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+#include <fstream>
+#include <future>
+#include <memory>
+#include <string>
+
+#include "platform/dispatch/SerialQueue.h"
+#include "platform/relay/Connection.h"
+
+namespace {
+
+relay::UniqueFd plugInSocket;
+
+std::string start(const std::string& plugIn) {
+  auto queue = tn::dispatch::SerialQueue::create("host");
+  auto connection = relay::Connection::connectToService("com.ostrel.tenon.warden", queue);
+  if (!connection.ok()) return "error 0 " + connection.error().description();
+  (*connection)->setEventHandler([](const relay::Event&) {});
+  (*connection)->resume();
+  std::promise<std::pair<relay::Reply, relay::Descriptors>> promise;
+  (*connection)->sendWithReply(tn::Dictionary{{"request", "start"}, {"plug-in", plugIn}}, relay::Descriptors(),
+                               queue, [&](relay::Reply reply, relay::Descriptors descriptors) {
+                                 promise.set_value({std::move(reply), std::move(descriptors)});
+                               });
+  auto [reply, descriptors] = promise.get_future().get();
+  (*connection)->cancel();
+  if (!reply.ok()) return "error 0 " + reply.error().description();
+  if (const auto code = (*reply)["errorcode"].uint64()) {
+    const std::string* message = (*reply)["error"].string();
+    return "error " + std::to_string(*code) + " " + (message ? *message : "");
+  }
+  if (descriptors.size() != 1) return "error 0 the reply brought " + std::to_string(descriptors.size()) + " descriptors";
+  plugInSocket = std::move(descriptors[0]);
+  return "started " + std::to_string((*reply)["pid"].int64().value_or(0));
+}
+
+std::string send(const std::string& line) {
+  if (!plugInSocket.valid()) return "closed";
+  const std::string text = line + "\n";
+  if (::write(plugInSocket.get(), text.data(), text.size()) != static_cast<ssize_t>(text.size())) return "closed";
+  std::string answer;
+  char c = 0;
+  while (::read(plugInSocket.get(), &c, 1) == 1) {
+    if (c == '\n') return answer;
+    answer.push_back(c);
+  }
+  return "closed";
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  if (argc != 3) {
+    std::fprintf(stderr, "usage: warden_host <command fifo> <answer fifo>\n");
+    return 2;
+  }
+  std::ifstream commands(argv[1]);
+  std::ofstream answers(argv[2]);
+  for (std::string line; std::getline(commands, line);) {
+    std::string answer;
+    if (line.rfind("start ", 0) == 0) {
+      answer = start(line.substr(6));
+    } else if (line.rfind("send ", 0) == 0) {
+      answer = send(line.substr(5));
+    } else if (line == "exit") {
+      answers << "bye" << std::endl;
+      return 0;
+    } else {
+      answer = "unknown command";
+    }
+    answers << answer << std::endl;
+  }
+  return 0;
+}

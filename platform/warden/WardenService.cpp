@@ -52,9 +52,12 @@ tn::Result<std::unique_ptr<WardenService>> WardenService::create(std::shared_ptr
   auto listener = relay::Listener::create(serviceName, tn::dispatch::SerialQueue::create("warden.listener"));
   if (!listener.ok()) return listener.error();
   service->listener_ = std::move(*listener);
-  const WardenService* self = service.get();  // the listener goes before the service
+  // The handler holds what it needs itself: a connection accepted while
+  // the service is being destroyed still finds it.
   service->listener_->setNewConnectionHandler(
-      [self](std::shared_ptr<relay::Connection> connection) { self->accept(connection); });
+      [warden = service->warden_, isPrivileged = service->isPrivileged_](std::shared_ptr<relay::Connection> connection) {
+        accept(connection, warden, isPrivileged);
+      });
   service->listener_->resume();
   return service;
 }
@@ -66,11 +69,13 @@ WardenService::~WardenService() {
   if (listener_) listener_->cancel();
 }
 
-void WardenService::accept(const std::shared_ptr<relay::Connection>& connection) const {
+void WardenService::accept(const std::shared_ptr<relay::Connection>& connection, std::shared_ptr<Warden> warden,
+                           PrivilegeTest isPrivileged) {
   // The handler holds the connection weakly (a connection keeps itself alive
   // until it ends) and the supervisor strongly.
   const std::weak_ptr<relay::Connection> weak = connection;
-  connection->setEventHandler([weak, warden = warden_, isPrivileged = isPrivileged_](const relay::Event& event) {
+  connection->setEventHandler([weak, warden = std::move(warden),
+                               isPrivileged = std::move(isPrivileged)](const relay::Event& event) {
     const auto live = weak.lock();
     if (!live || event.kind != relay::Event::Kind::Message) return;
     relay::UniqueFd hostSocket;

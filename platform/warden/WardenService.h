@@ -58,7 +58,8 @@ class WardenService {
 
  private:
   WardenService(std::shared_ptr<Warden> warden, PrivilegeTest isPrivileged);
-  void accept(const std::shared_ptr<relay::Connection>& connection) const;
+  static void accept(const std::shared_ptr<relay::Connection>& connection, std::shared_ptr<Warden> warden,
+                     PrivilegeTest isPrivileged);
 
   const std::shared_ptr<Warden> warden_;
   const PrivilegeTest isPrivileged_;

@@ -23,6 +23,7 @@ TEST(PollerWatch, RunsOnTheQueueWhenTheWatchedProcessExits) {
   ASSERT_EQ(::pipe(release), 0);
   const pid_t child = ::fork();
   if (child == 0) {
+    ::close(release[1]);
     char byte;
     [[maybe_unused]] const ssize_t n = ::read(release[0], &byte, 1);
     ::_exit(0);

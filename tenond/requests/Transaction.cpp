@@ -20,7 +20,7 @@ namespace tnd {
 const Transaction::Route Transaction::kRoutes[] = {
     {"add", &Transaction::addPlugIns},     {"remove", &Transaction::removePlugIns},
     {"bulk", &Transaction::bulkPlugIns},   {"match", &Transaction::matchPlugIns},
-    {"ready", &Transaction::unrecognized}, {"access", &Transaction::accessPlugIns},
+    {"ready", &Transaction::readyPlugIns}, {"access", &Transaction::accessPlugIns},
     {"annotate", &Transaction::annotatePlugIns}, {"bulk-annotate", &Transaction::bulkAnnotatePlugIns},
     {"lock", &Transaction::unrecognized},  {"find", &Transaction::findPlugIn},
     // Tenon's own, beyond the ten request types: why a plug-in is or is not

@@ -12,6 +12,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "platform/relay/Connection.h"
@@ -129,8 +130,18 @@ class Transaction {
   // "host") and plug-in ("uuids" or "paths"); none when the request failed.
   std::shared_ptr<const TNDHost> explainedHost();
   std::shared_ptr<TNDPlugIn> explainedPlugIn();
-  // "access" (AccessRequests.cpp): a read-only file token per plug-in bundle.
+  // Readiness requests (ReadinessRequests.cpp): "ready" makes plug-ins
+  // launchable for the client; "access" gives a read-only file token per
+  // plug-in bundle.
+  void readyPlugIns();
   void accessPlugIns();
+  // "ready"'s environment: none when the request failed (no entitlement);
+  // else the dictionary given, or none when `environment` is absent or not
+  // a dictionary.
+  std::optional<std::optional<tn::Dictionary>> readyEnvironment();
+  // Registers plug-ins with the process supervisor for this client
+  // (TNDPlugIn::ExternalServiceRegistrar).
+  std::function<int(const std::string& executablePath, const tn::Value& overlay)> registrarForClient() const;
   // Annotation requests (AnnotationRequests.cpp).
   void annotatePlugIns();
   void bulkAnnotatePlugIns();

@@ -23,6 +23,7 @@
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/relay/Connection.h"
 #include "platform/sandbox/SandboxCheck.h"
+#include "tests/e2e/AnnotationTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
 
@@ -246,6 +247,103 @@ TEST_F(WardenTest, HostsStartOnlyWhatWasRegisteredForThemAndRegistrationsEndWith
   }
   const tn::Value after = ask("com.ostrel.tenon.warden", tn::Dictionary{{"request", "list"}})["registrations"];
   EXPECT_EQ(after, tn::Value(tn::Array{})) << daemon_.log();
+}
+
+// "ready" end to end: the daemon registers what a host readies with the
+// real supervisor, so that the host can then start it; every named plug-in
+// is checked before any is enabled.
+const std::string kApplication = "opt/tenon/applications/TextTools";
+
+void prepareApplication(const std::string& root, uid_t hostUid) {
+  prepareRoot(root, hostUid);
+  const fs::path app = fs::path(root) / kApplication;
+  tn::test::makeBundle(app.string(), R"({"BNBundleIdentifier": "com.example.texttools"})");
+  const fs::path upcase = app / "Support/PlugIns/Upcase.tnx";
+  install(TENON_SOURCE_DIR "/examples/plugins/Upcase.bundle/Info.manifest", upcase / "Info.manifest", fs::perms(0644));
+  install(TENON_BINARY_DIR "/examples/plugins/upcase/upcase", upcase / "bin/upcase", fs::perms(0755));
+  tn::test::makeBundle((app / "Support/PlugIns/Words.tnx").string(), R"({"BNBundleIdentifier": "com.example.words",
+      "XTExtension": {"XTExtensionPointIdentifier": "com.example.text-service", "XTExtensionProtocol": "#Data",
+                      "XTExtensionAttributes": {}}})");
+  tn::test::makeBundle((app / "Support/PlugIns/Demanding.tnx").string(), R"({"BNBundleIdentifier": "com.example.demanding",
+      "BNBundleExecutable": "upcase",
+      "XTExtension": {"XTExtensionPointIdentifier": "com.example.text-service",
+                      "XTExtensionHostEntitlement": "com.example.host", "XTExtensionAttributes": {}}})");
+}
+
+class Readiness : public ::testing::Test {
+ protected:
+  Readiness()
+      : hostUid_(::geteuid() == 0 ? kNobody : ::geteuid()),
+        daemon_(tn::test::tenondBinaryPath(), {},
+                [this](const std::string& root) { prepareApplication(root, hostUid_); }) {
+    ::setenv("TENON_ROOT", daemon_.root().c_str(), 1);
+  }
+  ~Readiness() override { ::unsetenv("TENON_ROOT"); }
+
+  tn::UUID uuidOf(const std::string& bundle) {
+    return tn::test::registeredUUID(daemon_.root(), daemon_.root() + "/" + kApplication + "/Support/PlugIns/" + bundle);
+  }
+  tn::Value ready(tn::Array uuids, std::optional<tn::Value> environment = std::nullopt) {
+    tn::Dictionary request{{"request", "ready"}, {"version", 3}, {"uuids", tn::Value(std::move(uuids))}};
+    if (environment) request.set("environment", *environment);
+    return ask(daemon_.service(), std::move(request));
+  }
+  // This test program's registrations with the supervisor.
+  tn::Value registrations() {
+    return ask("com.ostrel.tenon.warden", tn::Dictionary{{"request", "list"}})["registrations"];
+  }
+
+  const uid_t hostUid_;
+  DaemonProcess daemon_;
+};
+
+TEST_F(Readiness, AReadiedPlugInStartsForItsHostWithTheMergedEnvironment) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  const tn::UUID upcase = uuidOf("Upcase.tnx");
+  ASSERT_FALSE(upcase.isNil()) << daemon_.log();
+  Host host(daemon_.root(), hostUid_);
+  EXPECT_EQ(host.command(std::string("start ") + kPlugIn).rfind("error 1 ", 0), 0u) << "not readied yet";
+  ASSERT_EQ(host.command("ready " + daemon_.service() + " " + upcase.string()), "ready") << daemon_.log();
+  ASSERT_GT(startedPid(host.command(std::string("start ") + kPlugIn)), 0) << daemon_.log();
+  EXPECT_EQ(host.command("send ready and running"), "READY AND RUNNING");
+  const std::string environment = host.command("send env");
+  const std::string container = daemon_.root() + "/var/lib/tenon/containers/" + kPlugIn;
+  for (const std::string& expected : {"HOME=" + container, "BNFIXED_USER_HOME=" + container,
+                                      "TMPDIR=" + container + "/tmp", std::string("TENON_PLUGIN_SOCKET=3")}) {
+    EXPECT_NE(environment.find(expected), std::string::npos) << expected << " in " << environment;
+  }
+  EXPECT_NE(daemon_.log().find("assigning plug-in com.example.upcase"), std::string::npos);
+}
+
+TEST_F(Readiness, EveryPlugInIsCheckedBeforeAnyIsEnabled) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  const tn::UUID upcase = uuidOf("Upcase.tnx");
+  const tn::UUID words = uuidOf("Words.tnx");
+  const tn::UUID demanding = uuidOf("Demanding.tnx");
+  ASSERT_FALSE(upcase.isNil() || words.isNil() || demanding.isNil()) << daemon_.log();
+
+  // The second is refused: the first is not enabled either.
+  const tn::Value refused = ready({tn::Value(upcase), tn::Value(demanding)});
+  EXPECT_EQ(refused["errorcode"], tn::Value(uint64_t{11})) << refused;
+  EXPECT_EQ(refused["error"], tn::Value("access to plugin com.example.demanding denied: the host does not have the "
+                                        "\"com.example.host\" entitlement"));
+  EXPECT_EQ(registrations(), tn::Value(tn::Array{}));
+
+  // An environment, even empty, needs the entitlement; a number is no
+  // environment at all.
+  const tn::Value empty = ready({tn::Value(upcase)}, tn::Value(tn::Dictionary{}));
+  EXPECT_EQ(empty["error"], tn::Value("Transmission of environment variables requires the "
+                                      "com.ostrel.developer.tenon.provide-environment host entitlement"));
+  EXPECT_EQ(registrations(), tn::Value(tn::Array{}));
+
+  // A data plug-in is skipped; the same plug-in twice is enabled once.
+  const tn::Value readied = ready({tn::Value(words), tn::Value(upcase), tn::Value(upcase)}, tn::Value(5));
+  EXPECT_TRUE(readied["errorcode"].isNull()) << readied << daemon_.log();
+  const tn::Value listed = registrations();
+  ASSERT_TRUE(listed.array() && listed.array()->size() == 1) << listed;
+  EXPECT_EQ((*listed.array())[0]["BNBundleIdentifier"], tn::Value(kPlugIn)) << listed;
+
+  EXPECT_TRUE(ready({})["errorcode"].isNull()) << "nothing named, nothing to do";
 }
 
 }  // namespace

@@ -6,6 +6,9 @@
 //                     "error <code> <message>"; keeps the socket it got
 //   send <line>       writes the line to the plug-in, answers the plug-in's
 //                     answer line ("closed" when it went away)
+//   ready <service> <uuid>
+//                     asks the daemon (its relay service) to make the plug-in
+//                     ready for this process; "ready" or "error <code> <message>"
 //   exit              answers "bye" and exits
 //
 // It uses the relay like any host: TENON_ROOT names the platform root.
@@ -18,6 +21,7 @@
 #include <fstream>
 #include <future>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "platform/dispatch/SerialQueue.h"
@@ -50,6 +54,30 @@ std::string start(const std::string& plugIn) {
   return "started " + std::to_string((*reply)["pid"].int64().value_or(0));
 }
 
+std::string ready(const std::string& arguments) {
+  const std::size_t space = arguments.find(' ');
+  const std::optional<tn::UUID> uuid =
+      space == std::string::npos ? std::nullopt : tn::UUID::parse(arguments.substr(space + 1));
+  if (!uuid) return "error 0 usage: ready <service> <uuid>";
+  auto queue = tn::dispatch::SerialQueue::create("host");
+  auto connection = relay::Connection::connectToService(arguments.substr(0, space), queue);
+  if (!connection.ok()) return "error 0 " + connection.error().description();
+  (*connection)->setEventHandler([](const relay::Event&) {});
+  (*connection)->resume();
+  std::promise<relay::Reply> promise;
+  (*connection)->sendWithReply(
+      tn::Dictionary{{"request", "ready"}, {"version", 3}, {"uuids", tn::Array{tn::Value(*uuid)}}}, queue,
+      [&](relay::Reply reply) { promise.set_value(std::move(reply)); });
+  relay::Reply reply = promise.get_future().get();
+  (*connection)->cancel();
+  if (!reply.ok()) return "error 0 " + reply.error().description();
+  if (const auto code = (*reply)["errorcode"].uint64()) {
+    const std::string* message = (*reply)["error"].string();
+    return "error " + std::to_string(*code) + " " + (message ? *message : "");
+  }
+  return "ready";
+}
+
 std::string send(const std::string& line) {
   if (!plugInSocket.valid()) return "closed";
   const std::string text = line + "\n";
@@ -76,6 +104,8 @@ int main(int argc, char** argv) {
     std::string answer;
     if (line.rfind("start ", 0) == 0) {
       answer = start(line.substr(6));
+    } else if (line.rfind("ready ", 0) == 0) {
+      answer = ready(line.substr(6));
     } else if (line.rfind("send ", 0) == 0) {
       answer = send(line.substr(5));
     } else if (line == "exit") {

@@ -26,6 +26,7 @@
 #include "tests/e2e/AnnotationTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
+#include "tests/support/TrustedInstall.h"
 
 namespace {
 
@@ -42,6 +43,22 @@ void install(const fs::path& from, const fs::path& to, fs::perms mode) {
   fs::permissions(to, mode);
 }
 
+// Every directory under root traversable and readable by every user (the
+// plug-in and the host may run as 65534, and the checkout's umask may be
+// 027), except the data containers, which belong to the plug-in's user.
+void openDirectories(const std::string& root) {
+  const fs::path containers = fs::path(root) / "var/lib/tenon/containers";
+  fs::permissions(root, fs::perms(0755));
+  for (auto entry = fs::recursive_directory_iterator(root); entry != fs::recursive_directory_iterator(); ++entry) {
+    if (entry->path() == containers) {
+      fs::permissions(entry->path(), fs::perms(0755));
+      entry.disable_recursion_pending();
+    } else if (entry->is_directory() && !entry->is_symlink()) {
+      fs::permissions(entry->path(), fs::perms(0755));
+    }
+  }
+}
+
 // What the daemon's root needs: the profiles, the example bundle, and the
 // plug-in's data container, owned by the user the plug-in will run as.
 void prepareRoot(const std::string& root, uid_t hostUid) {
@@ -54,10 +71,7 @@ void prepareRoot(const std::string& root, uid_t hostUid) {
   install(TENON_BINARY_DIR "/examples/plugins/upcase/upcase", bundle / "bin/upcase", fs::perms(0755));
   const fs::path container = fs::path(root) / "var/lib/tenon/containers" / kPlugIn;
   fs::create_directories(container);
-  for (fs::path at = root; at != container;) {  // every level traversable
-    fs::permissions(at, fs::perms(0755));
-    at /= container.lexically_relative(at).begin()->string();
-  }
+  openDirectories(root);
   ASSERT_EQ(::chown(container.c_str(), hostUid, hostUid), 0);
   fs::permissions(container, fs::perms(0700));
 }
@@ -98,8 +112,12 @@ class Host {
     commandFd_ = ::open(commands_.c_str(), O_RDWR | O_CLOEXEC);
     answerFd_ = ::open(answers_.c_str(), O_RDWR | O_CLOEXEC);
     const bool drop = ::geteuid() == 0;
+    // A copy in the root, which every user may traverse: the build tree may
+    // not be (a checkout made with umask 027), and the host may run as 65534.
+    const std::string program =
+        tn::test::installFile(TENON_BINARY_DIR "/tests/e2e/warden_host", root, "usr/libexec/warden_host", 0755);
     child_ = std::make_unique<ChildProcess>(
-        std::vector<std::string>{TENON_BINARY_DIR "/tests/e2e/warden_host", commands_, answers_},
+        std::vector<std::string>{program, commands_, answers_},
         std::vector<std::string>{"TENON_ROOT=" + root}, [drop, uid] {
           if (!drop) return true;
           return ::syscall(SYS_setgroups, 0, nullptr) == 0 && ::syscall(SYS_setresgid, uid, uid, uid) == 0 &&
@@ -268,6 +286,7 @@ void prepareApplication(const std::string& root, uid_t hostUid) {
       "BNBundleExecutable": "upcase",
       "XTExtension": {"XTExtensionPointIdentifier": "com.example.text-service",
                       "XTExtensionHostEntitlement": "com.example.host", "XTExtensionAttributes": {}}})");
+  openDirectories(root);
 }
 
 class Readiness : public ::testing::Test {
@@ -344,6 +363,33 @@ TEST_F(Readiness, EveryPlugInIsCheckedBeforeAnyIsEnabled) {
   EXPECT_EQ((*listed.array())[0]["BNBundleIdentifier"], tn::Value(kPlugIn)) << listed;
 
   EXPECT_TRUE(ready({})["errorcode"].isNull()) << "nothing named, nothing to do";
+}
+
+TEST_F(Readiness, TnctlStartRunsAPlugInForItselfAndRelaysItsStandardStreams) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  ASSERT_FALSE(uuidOf("Upcase.tnx").isNil()) << daemon_.log();
+  const std::string tnctl =
+      tn::test::installFile(TENON_BINARY_DIR "/tools/tnctl/tnctl", daemon_.root(), "usr/bin/tnctl", 0755);
+  const std::string input = daemon_.root() + "/input.txt";
+  std::ofstream(input) << "quiet words\nand more\n";
+  fs::permissions(input, fs::perms(0644));
+  const std::string upcase = daemon_.root() + "/" + kApplication + "/Support/PlugIns/Upcase.tnx";
+  const bool drop = ::geteuid() == 0;
+  const uid_t uid = hostUid_;
+  const char* inputPath = input.c_str();
+  ChildProcess started({tnctl, "start", upcase, "--service", daemon_.service()},
+                       tn::test::environmentWith(daemon_.environment()), [=] {
+                         const int fd = ::open(inputPath, O_RDONLY);
+                         if (fd < 0 || ::dup2(fd, STDIN_FILENO) < 0) return false;
+                         if (!drop) return true;
+                         return ::syscall(SYS_setgroups, 0, nullptr) == 0 &&
+                                ::syscall(SYS_setresgid, uid, uid, uid) == 0 &&
+                                ::syscall(SYS_setresuid, uid, uid, uid) == 0;
+                       });
+  const tn::test::ProcessResult result = started.finish();
+  EXPECT_EQ(result.exitStatus, 0) << result.err << daemon_.log();
+  EXPECT_EQ(result.out, "QUIET WORDS\nAND MORE\n");
+  EXPECT_EQ(result.err.rfind("tnctl: started com.example.upcase (pid ", 0), 0u) << result.err;
 }
 
 }  // namespace

@@ -43,5 +43,6 @@ void addRequestCommand(CLI::App& app, const GlobalOptions& options);        // r
 
 // The supervisor's own service.
 void addWardenCommands(CLI::App& app, const GlobalOptions& options);  // warden list
+void addStartCommand(CLI::App& app, const GlobalOptions& options);    // start: find, ready, start, talk
 
 }  // namespace tnctl

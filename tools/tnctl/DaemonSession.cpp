@@ -59,6 +59,17 @@ void runClientOperation(const GlobalOptions& options, const ClientOperation& ope
   run(options, operation, {}, emptySuccess);
 }
 
+void runClientOperationQuietly(const GlobalOptions& options, const ClientOperation& operation,
+                               const ReadablePrinter& succeeded) {
+  tn::TNDaemonClient client(options.service);
+  const relay::Reply reply = await(options, operation, client);
+  if (!reply) failUnreachable(options, reply.error());
+  if (const std::optional<tn::Error> error = errorIn(reply)) {
+    fail(fmt::format("error {}: {}", error->code(), error->localizedDescription()));
+  }
+  succeeded(client, *reply);
+}
+
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
                         const ReadablePrinter& readable) {
   run(options, operation, readable, "ok");

@@ -32,4 +32,9 @@ void runClientOperation(const GlobalOptions& options, const ClientOperation& ope
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
                         const ReadablePrinter& readable);
 
+// Runs `operation` and hands a successful reply to `succeeded` without
+// printing anything; fails the command as runClientOperation does.
+void runClientOperationQuietly(const GlobalOptions& options, const ClientOperation& operation,
+                               const ReadablePrinter& succeeded);
+
 }  // namespace tnctl

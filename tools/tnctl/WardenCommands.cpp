@@ -2,12 +2,16 @@
 //   the supervisor's registrations and running plug-in instances: every one
 //   for a privileged user, the caller's own otherwise. Readable, one line
 //   each, or the reply as one JSON document with --json.
+// tnctl warden busy BUNDLE-IDENTIFIER... [--vigil-service NAME]
+//   the running instances of those bundles that declared themselves busy
+//   (privileged users only), as the daemon sees them before a hold.
 
 #include <fmt/format.h>
 
 #include <cstdio>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "libtenon/client/BlockingReply.h"
 #include "platform/dispatch/SerialQueue.h"
@@ -40,19 +44,50 @@ void printWardenListing(const tn::Value& reply) {
   }
 }
 
-tn::Value askWarden(const std::string& service, unsigned timeoutSeconds) {
+tn::Value askService(const std::string& service, tn::Value request, unsigned timeoutSeconds) {
   const auto queue = tn::dispatch::SerialQueue::create("tnctl.warden");
   auto connection = relay::Connection::connectToService(service, queue);
   if (!connection.ok()) fail(fmt::format("cannot reach {}: {}", service, connection.error().localizedDescription()));
   (*connection)->setEventHandler([](const relay::Event&) {});
   (*connection)->resume();
   tn::BlockingReply pending;
-  (*connection)->sendWithReply(tn::Dictionary{{"request", "list"}}, queue, pending.block());
+  (*connection)->sendWithReply(std::move(request), queue, pending.block());
   relay::Reply reply = pending.wait(std::chrono::seconds(timeoutSeconds));
   (*connection)->cancel();
   if (!reply.ok()) fail(fmt::format("{}: {}", service, reply.error().localizedDescription()));
   if ((*reply)["errorcode"].uint64()) fail(fmt::format("{}: {}", service, wardenField((*reply)["error"])));
   return *reply;
+}
+
+void printJsonReply(const tn::Value& reply) {
+  tn::Result<std::string> document = tn::writeJsonDocument(reply);
+  if (!document.ok()) fail(document.error().localizedDescription());
+  std::fputs(document->c_str(), stdout);
+}
+
+void addBusyCommand(CLI::App& warden, const GlobalOptions& options) {
+  struct BusyOptions {
+    std::vector<std::string> identifiers;
+    std::string service = "com.ostrel.tenon.vigil";
+  };
+  auto arguments = std::make_shared<BusyOptions>();
+  CLI::App* busy = warden.add_subcommand("busy", "Running plug-in instances that declared themselves busy");
+  busy->add_option("BUNDLE-IDENTIFIER", arguments->identifiers, "Bundle identifiers of plug-ins")->required();
+  busy->add_option("--vigil-service", arguments->service, "The busy-assertion service")->capture_default_str();
+  busy->callback([&options, arguments] {
+    tn::Array identifiers;
+    for (const std::string& identifier : arguments->identifiers) identifiers.push_back(tn::Value(identifier));
+    const tn::Value reply = askService(
+        arguments->service, tn::Dictionary{{"request", "busy-instances"}, {"identifiers", std::move(identifiers)}},
+        options.timeoutSeconds);
+    if (options.json) return printJsonReply(reply);
+    const tn::Array* instances = reply["instances"].array();
+    std::printf("busy instances: %zu\n", instances ? instances->size() : 0);
+    for (const tn::Value& entry : instances ? *instances : tn::Array{}) {
+      std::printf("  pid %s  %s %s\n", wardenField(entry["pid"]).c_str(), wardenField(entry["BNBundleIdentifier"]).c_str(),
+                  wardenField(entry["BNBundleVersion"]).c_str());
+    }
+  });
 }
 
 }  // namespace
@@ -64,12 +99,11 @@ void addWardenCommands(CLI::App& app, const GlobalOptions& options) {
   CLI::App* list = warden->add_subcommand("list", "Registrations and running plug-in instances");
   list->add_option("--warden-service", *service, "The supervisor's relay service")->capture_default_str();
   list->callback([&options, service] {
-    const tn::Value reply = askWarden(*service, options.timeoutSeconds);
+    const tn::Value reply = askService(*service, tn::Dictionary{{"request", "list"}}, options.timeoutSeconds);
     if (!options.json) return printWardenListing(reply);
-    tn::Result<std::string> document = tn::writeJsonDocument(reply);
-    if (!document.ok()) fail(document.error().localizedDescription());
-    std::fputs(document->c_str(), stdout);
+    printJsonReply(reply);
   });
+  addBusyCommand(*warden, options);
 }
 
 }  // namespace tnctl

@@ -43,6 +43,7 @@ int main(int argc, char** argv) {
   tnctl::addHoldCommands(app, options);
   tnctl::addRequestCommand(app, options);
   tnctl::addWardenCommands(app, options);
+  tnctl::addStartCommand(app, options);
 
   quietLibraryLogs();
   try {

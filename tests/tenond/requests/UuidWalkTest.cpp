@@ -20,6 +20,7 @@
 #include "tenond/server/TNDRelayClient.h"
 #include "tenond/server/TNDServer.h"
 #include "tests/platform/bundle/BundleTestSupport.h"
+#include "tests/tenond/requests/InProcessClient.h"
 
 namespace tnd {
 namespace {
@@ -62,21 +63,9 @@ class UuidWalk : public ::testing::Test {
 
   // The daemon's client object for a connection from this process.
   static std::shared_ptr<TNDRelayClient> connectClient() {
-    auto listener = relay::Listener::create("walk.test.pair", tn::dispatch::SerialQueue::create("pair"));
-    EXPECT_TRUE(listener);
-    std::promise<std::shared_ptr<TNDRelayClient>> made;
-    (*listener)->setNewConnectionHandler([&](std::shared_ptr<relay::Connection> c) {
-      made.set_value(TNDRelayClient::initWithConnection(std::move(c), server_));
-    });
-    (*listener)->resume();
-    auto peer = relay::Connection::connectToService("walk.test.pair", tn::dispatch::SerialQueue::create("peer"));
-    EXPECT_TRUE(peer);
-    (*peer)->setEventHandler([](const relay::Event&) {});
-    (*peer)->resume();
-    peer_ = *peer;
-    std::shared_ptr<TNDRelayClient> client = made.get_future().get();
-    (*listener)->cancel();
-    return client;
+    test::InProcessClient connected = test::connectInProcessClient(server_, "walk.test.pair");
+    peer_ = connected.peer;
+    return connected.client;
   }
 
   // Walks `body` (with the envelope added) handing each plug-in's

@@ -15,29 +15,13 @@
 namespace tn::test {
 namespace {
 
-class Access : public ::testing::Test {
+class Access : public NotesDaemonTest {
  protected:
-  void SetUp() override {
-    ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
-    ::setenv("TENON_ROOT", daemon_.root().c_str(), 1);
-    for (const std::string& path : paths_) {
-      uuids_.push_back(registeredUUID(daemon_.root(), path));
-      ASSERT_FALSE(uuids_.back().isNil()) << path << " never registered\n" << daemon_.log();
-    }
-    peer_ = std::make_unique<RelayPeer>(daemon_.service());
-    ASSERT_TRUE(peer_->connected());
-  }
-  void TearDown() override { ::unsetenv("TENON_ROOT"); }
+  Access() : NotesDaemonTest({"One", "Two"}) {}
 
   Value access(Array uuids) {
     return peer_->request({{"request", "access"}, {"version", 3}, {"uuids", Value(std::move(uuids))}});
   }
-
-  std::vector<std::string> paths_;  // before daemon_, which fills it
-  DaemonProcess daemon_{tenondBinaryPath(), {},
-                        [this](const std::string& root) { paths_ = installNotes(root, {"One", "Two"}); }};
-  std::vector<UUID> uuids_;
-  std::unique_ptr<RelayPeer> peer_;
 };
 
 TEST_F(Access, OneVerifiableTokenPerBundleInRequestOrder) {

@@ -23,19 +23,9 @@ namespace {
 
 constexpr const char* kChange = "com.ostrel.tenon.annotation-change";
 
-class Annotation : public ::testing::Test {
+class Annotation : public NotesDaemonTest {
  protected:
-  void SetUp() override {
-    ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
-    ::setenv("TENON_ROOT", daemon_.root().c_str(), 1);
-    for (const std::string& path : paths_) {
-      uuids_.push_back(registeredUUID(daemon_.root(), path));
-      ASSERT_FALSE(uuids_.back().isNil()) << path << " never registered\n" << daemon_.log();
-    }
-    peer_ = std::make_unique<RelayPeer>(daemon_.service());
-    ASSERT_TRUE(peer_->connected());
-  }
-  void TearDown() override { ::unsetenv("TENON_ROOT"); }
+  Annotation() : NotesDaemonTest({"One", "Two", "Three"}) {}
 
   Value send(Dictionary body) { return peer_->request(std::move(body)); }
   static uint64_t notifications() { return *notify::postCount(kChange); }
@@ -63,12 +53,6 @@ class Annotation : public ::testing::Test {
     arguments.insert(arguments.end(), {"--service", daemon_.service()});
     return runProcess(arguments, daemon_.environment());
   }
-
-  std::vector<std::string> paths_;  // before daemon_, which fills it
-  DaemonProcess daemon_{tenondBinaryPath(), {},
-                        [this](const std::string& root) { paths_ = installNotes(root, {"One", "Two", "Three"}); }};
-  std::vector<UUID> uuids_;
-  std::unique_ptr<RelayPeer> peer_;
 };
 
 void expectFailure(const Value& reply, uint64_t code, const std::string& message) {

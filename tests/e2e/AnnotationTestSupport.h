@@ -8,6 +8,8 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
+#include <cstdlib>
+#include <memory>
 #include <string>
 #include <thread>
 #include <vector>
@@ -18,6 +20,8 @@
 #include "platform/value/UUID.h"
 #include "platform/value/Value.h"
 #include "tests/platform/bundle/BundleTestSupport.h"
+#include "tests/support/DaemonProcess.h"
+#include "tests/support/RelayPeer.h"
 #include "tests/support/Subprocess.h"
 
 namespace tn::test {
@@ -86,5 +90,32 @@ inline Value storedAnnotations(const std::string& path) {
   const Result<Value> document = readDocumentFile(path);
   return document.ok() ? (*document)["data"] : Value();
 }
+
+// A real tenond on a private root holding the Notes application with one
+// data plug-in per name, the plug-ins' paths and UUIDs, and a relay peer of
+// the daemon (this process). TENON_ROOT names the root while a test runs.
+class NotesDaemonTest : public ::testing::Test {
+ protected:
+  explicit NotesDaemonTest(std::vector<std::string> names) : names_(std::move(names)) {}
+
+  void SetUp() override {
+    ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+    ::setenv("TENON_ROOT", daemon_.root().c_str(), 1);
+    for (const std::string& path : paths_) {
+      uuids_.push_back(registeredUUID(daemon_.root(), path));
+      ASSERT_FALSE(uuids_.back().isNil()) << path << " never registered\n" << daemon_.log();
+    }
+    peer_ = std::make_unique<RelayPeer>(daemon_.service());
+    ASSERT_TRUE(peer_->connected());
+  }
+  void TearDown() override { ::unsetenv("TENON_ROOT"); }
+
+  const std::vector<std::string> names_;
+  std::vector<std::string> paths_;  // before daemon_, which fills it
+  DaemonProcess daemon_{tenondBinaryPath(), {},
+                        [this](const std::string& root) { paths_ = installNotes(root, names_); }};
+  std::vector<UUID> uuids_;
+  std::unique_ptr<RelayPeer> peer_;
+};
 
 }  // namespace tn::test

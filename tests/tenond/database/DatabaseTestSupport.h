@@ -42,6 +42,22 @@ class RecordingDelegate final : public TNDatabaseDelegate {
   std::vector<registrar::PlugInList> batches;
 };
 
+// The daemon's record of the registrar's `record`, with `entitlements` and
+// `dataContainer` in place of the registrar's (tests choose what the code
+// signature and the container would say); null when the daemon refuses it.
+inline std::shared_ptr<TNDPlugIn> daemonRecord(const registrar::PlugInPtr& record,
+                                               const std::shared_ptr<registrar::Registrar>& registrar,
+                                               const tn::TNRegistryLookup& lookup, const tn::Value& entitlements,
+                                               std::optional<std::string> dataContainer) {
+  registrar::PlugInRecord::Fields fields{record->uuid(), record->bundlePath(), record->containingApp(),
+                                         record->bundleIdentifier(), record->identifier(), record->bundleVersion(),
+                                         record->plugInDictionary(), record->infoDictionary(),
+                                         record->registrationDate(), record->onSystemPartition(),
+                                         record->localizedName(), record->localizedShortName(), entitlements,
+                                         std::move(dataContainer), record->registeredByURL()};
+  return TNDPlugIn::initWithRGData(std::make_shared<registrar::PlugInRecord>(std::move(fields)), registrar, lookup);
+}
+
 // Info and debug lines of the categories the database logs on, so that
 // tests can look for them.
 inline void enableAllLogLevels() {

@@ -58,17 +58,8 @@ class Activation : public ::testing::Test {
     EXPECT_TRUE(registrar_->scan().ok());
     const registrar::PlugInPtr record = registrar_->plugInForURL(tn::URL::fileURLWithPath(bundle));
     EXPECT_TRUE(record);
-    registrar::PlugInRecord::Fields fields{record->uuid(), record->bundlePath(), record->containingApp(),
-                                           record->bundleIdentifier(), record->identifier(), record->bundleVersion(),
-                                           record->plugInDictionary(), record->infoDictionary(),
-                                           record->registrationDate(), record->onSystemPartition(),
-                                           record->localizedName(), record->localizedShortName(),
-                                           Value(Dictionary{}),
-                                           withContainer ? std::optional<std::string>("/data/" + identifier)
-                                                         : std::nullopt,
-                                           record->registeredByURL()};
-    return TNDPlugIn::initWithRGData(std::make_shared<registrar::PlugInRecord>(std::move(fields)), registrar_,
-                                     *lookup_);
+    return daemonRecord(record, registrar_, *lookup_, Value(Dictionary{}),
+                        withContainer ? std::optional<std::string>("/data/" + identifier) : std::nullopt);
   }
 
   // The "RelayService" of the overlay, back in memory.

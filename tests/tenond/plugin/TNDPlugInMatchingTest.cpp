@@ -43,14 +43,7 @@ class Matching : public ::testing::Test {
     EXPECT_TRUE(registrar_->scan().ok());
     const registrar::PlugInPtr record = registrar_->plugInForURL(tn::URL::fileURLWithPath(bundle));
     EXPECT_TRUE(record);
-    registrar::PlugInRecord::Fields fields{record->uuid(), record->bundlePath(), record->containingApp(),
-                                           record->bundleIdentifier(), record->identifier(), record->bundleVersion(),
-                                           record->plugInDictionary(), record->infoDictionary(),
-                                           record->registrationDate(), record->onSystemPartition(),
-                                           record->localizedName(), record->localizedShortName(), entitlements,
-                                           record->dataContainerPath(), record->registeredByURL()};
-    auto built = TNDPlugIn::initWithRGData(std::make_shared<registrar::PlugInRecord>(std::move(fields)), registrar_,
-                                           *lookup_);
+    auto built = daemonRecord(record, registrar_, *lookup_, entitlements, record->dataContainerPath());
     EXPECT_TRUE(built);
     return built;
   }

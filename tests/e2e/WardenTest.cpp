@@ -24,6 +24,7 @@
 #include "platform/relay/Connection.h"
 #include "platform/sandbox/SandboxCheck.h"
 #include "tests/e2e/AnnotationTestSupport.h"
+#include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
 #include "tests/support/TrustedInstall.h"
@@ -169,10 +170,10 @@ class WardenTest : public ::testing::Test {
   std::string executable() const { return daemon_.root() + "/opt/plugins/Upcase.bundle/bin/upcase"; }
   std::string container() const { return daemon_.root() + "/var/lib/tenon/containers/" + kPlugIn; }
 
-  tn::Value registerFor(pid_t host) {
+  tn::Value registerFor(pid_t host, const std::string& program = "") {
     return ask("com.ostrel.tenon.warden", tn::Dictionary{{"request", "register"},
                                                          {"host", host},
-                                                         {"executable", executable()},
+                                                         {"executable", program.empty() ? executable() : program},
                                                          {"overlay", overlay()}});
   }
 
@@ -236,6 +237,32 @@ TEST_F(WardenTest, BusyDeclarationsAreSeenUntilTheInstanceIsIdle) {
   EXPECT_EQ((*busyNow.array())[0]["pid"], tn::Value(plugIn));
   ASSERT_EQ(host.command("send release"), "idle");
   EXPECT_EQ(busy()["instances"], tn::Value(tn::Array{}));
+}
+
+// The Python side: examples/python/upcase_plugin.py with the example client
+// beside it, started like any plug-in, declares itself busy and idle.
+TEST_F(WardenTest, APythonPlugInDeclaresItselfBusyThroughTheExampleClient) {
+  ASSERT_TRUE(daemon_.accepting()) << daemon_.log();
+  const fs::path bundle = fs::path(daemon_.root()) / "opt/plugins/PyUpcase.bundle";
+  tn::test::makeBundle(bundle.string(), R"({"BNBundleIdentifier": "com.example.pyupcase", "BNBundleVersion": "1.0",
+                                           "BNBundleExecutable": "upcase_plugin.py"})");
+  install(TENON_SOURCE_DIR "/examples/python/upcase_plugin.py", bundle / "bin/upcase_plugin.py", fs::perms(0755));
+  install(TENON_SOURCE_DIR "/examples/python/tenon_client.py", bundle / "bin/tenon_client.py", fs::perms(0644));
+  const fs::path container = fs::path(daemon_.root()) / "var/lib/tenon/containers/com.example.pyupcase";
+  fs::create_directories(container);
+  openDirectories(daemon_.root());
+  ASSERT_EQ(::chown(container.c_str(), hostUid_, hostUid_), 0);
+
+  Host host(daemon_.root(), hostUid_);
+  ASSERT_EQ(registerFor(host.pid(), (bundle / "bin/upcase_plugin.py").string()), tn::Value(tn::Dictionary{}));
+  ASSERT_GT(startedPid(host.command("start com.example.pyupcase")), 0) << daemon_.log();
+  EXPECT_EQ(host.command("send from python"), "FROM PYTHON") << daemon_.log();
+  ASSERT_EQ(host.command("send hold"), "busy") << daemon_.log();
+  const tn::Value busyNow = ask("com.ostrel.tenon.vigil", tn::Dictionary{{"request", "busy-instances"},
+                                                                         {"identifiers", tn::Array{tn::Value(
+                                                                                             "com.example.pyupcase")}}});
+  ASSERT_TRUE(busyNow["instances"].array() && busyNow["instances"].array()->size() == 1) << busyNow;
+  EXPECT_EQ(host.command("send release"), "idle");
 }
 
 TEST_F(WardenTest, HostsStartOnlyWhatWasRegisteredForThemAndRegistrationsEndWithThem) {

@@ -12,6 +12,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "platform/vigil/Vigil.h"
 #include "platform/warden/Warden.h"
 #include "tenond/requests/Transaction.h"
 #include "tenond/server/TNDPlugInHold.h"
@@ -43,10 +44,17 @@ class HeldPlugIns : public ::testing::Test {
                                                 "XTExtensionPointIdentifier": "com.example.p",
                                                 "XTExtensionProtocol": "com.example.protocol",
                                                 "XTExtensionAttributes": {}}})");
+      // Their program is the example plug-in, which answers line by line
+      // and declares itself busy while it works ("hold" until "release").
       fs::create_directories(plugIn / "bin");
-      std::ofstream(plugIn / "bin/run") << "#!/bin/sh\n";
+      fs::copy_file(TENON_BINARY_DIR "/examples/plugins/upcase/upcase", plugIn / "bin/run");
       fs::permissions(plugIn / "bin/run", fs::perms(0755));
       paths_.push_back(plugIn.string());
+    }
+    const fs::path profiles = root_ / "usr/share/tenon/sandbox-profiles";
+    fs::create_directories(profiles);
+    for (const auto& profile : fs::directory_iterator(TENON_SOURCE_DIR "/packaging/sandbox-profiles")) {
+      fs::copy_file(profile.path(), profiles / profile.path().filename());
     }
     server_ = TNDServer::initForService("held.test", std::nullopt);
     ASSERT_TRUE(server_);
@@ -95,6 +103,33 @@ TEST_F(HeldPlugIns, ReadyRefusesAHeldPlugInAndEnablesNoneOfTheOthers) {
   const Value readied = run({{"request", "ready"}});
   EXPECT_TRUE(readied["errorcode"].isNull()) << readied;
   EXPECT_EQ(server_->warden()->registrationCount(), 2u) << "both, once the hold is gone";
+}
+
+// What a running instance declares is what checkBusy sees: this process is
+// the host, readies the plug-ins, has the supervisor start one and makes it
+// busy; the daemon's record asks the busy-assertion service.
+TEST_F(HeldPlugIns, CheckBusySeesWhatARunningInstanceDeclares) {
+  ASSERT_TRUE(run({{"request", "ready"}})["errorcode"].isNull());
+  auto started = server_->warden()->start(connected_.client->peerIdentity().auditToken, "com.example.tools.First");
+  ASSERT_TRUE(started.ok()) << started.error().description();
+  const int plugIn = started->hostSocket.get();
+  const auto say = [plugIn](const std::string& line) {
+    const std::string text = line + "\n";
+    EXPECT_EQ(::write(plugIn, text.data(), text.size()), static_cast<ssize_t>(text.size()));
+    std::string answer;
+    for (char c = 0; ::read(plugIn, &c, 1) == 1 && c != '\n';) answer.push_back(c);
+    return answer;
+  };
+  const std::shared_ptr<TNDPlugIn> record = server_->findPlugIn(uuids_[0]);
+  ASSERT_TRUE(record);
+  const auto busyInstances = [](const std::set<std::string>& identifiers) {
+    return server_->vigil()->busyInstances(identifiers);
+  };
+  EXPECT_FALSE(record->checkBusy(busyInstances));
+  ASSERT_EQ(say("hold"), "busy");
+  EXPECT_EQ(record->checkBusy(busyInstances), Value(Dictionary{{"BNBundleIdentifier", "com.example.tools.First"}}));
+  ASSERT_EQ(say("release"), "idle");
+  EXPECT_FALSE(record->checkBusy(busyInstances));
 }
 
 }  // namespace

@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <mutex>
 
 #include <fmt/format.h>
 
@@ -19,17 +20,41 @@ namespace warden {
 namespace {
 
 // One removal: counts down the instances it waits for and answers once.
+// The SIGKILL timer is made after the instances were signalled, so an
+// instance may exit (on the supervisor's queue) while it is being set: the
+// timer and whether the removal answered are guarded together.
 struct Removal {
   std::shared_ptr<tn::dispatch::SerialQueue> queue;
   std::function<void(int)> reply;
   std::atomic<std::size_t> remaining{0};
-  std::shared_ptr<relay::PollerWatch> killTimer;
 
   void instanceExited() {
     if (remaining.fetch_sub(1) != 1) return;
-    if (killTimer) killTimer->cancel();
+    std::shared_ptr<relay::PollerWatch> timer;
+    {
+      const std::lock_guard lock(timerMutex_);
+      answered_ = true;
+      timer = std::move(killTimer_);
+    }
+    if (timer) timer->cancel();
     queue->async([reply = std::move(reply)] { reply(kTerminated); });
   }
+
+  void setKillTimer(std::shared_ptr<relay::PollerWatch> timer) {
+    {
+      const std::lock_guard lock(timerMutex_);
+      if (!answered_) {
+        killTimer_ = std::move(timer);
+        return;
+      }
+    }
+    if (timer) timer->cancel();  // every instance exited already
+  }
+
+ private:
+  std::mutex timerMutex_;
+  std::shared_ptr<relay::PollerWatch> killTimer_;  // guarded by timerMutex_
+  bool answered_ = false;                          // guarded by timerMutex_
 };
 
 }  // namespace
@@ -161,9 +186,9 @@ void Warden::removeExternalService(const std::string& bundleIdentifier, const st
   TN_LOG_INFO(tn::log::ops(), "warden: terminating {} instances of {}({})", signalled.size(), bundleIdentifier,
               version);
   const std::weak_ptr<Warden> weak = weak_from_this();
-  removal->killTimer = relay::PollerWatch::after(limits_.terminationGrace, queue_, [weak, signalled] {
+  removal->setKillTimer(relay::PollerWatch::after(limits_.terminationGrace, queue_, [weak, signalled] {
     if (const auto self = weak.lock()) self->killSurvivors(signalled);
-  });
+  }));
 }
 
 void Warden::killSurvivors(const std::vector<std::pair<pid_t, uint64_t>>& processes) {

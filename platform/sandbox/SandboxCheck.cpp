@@ -1,11 +1,9 @@
 #include "platform/sandbox/SandboxCheck.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
-#include <cerrno>
 #include <charconv>
 #include <string>
+
+#include "platform/sandbox/ProcFiles.h"
 
 namespace sandbox {
 namespace {
@@ -14,46 +12,12 @@ namespace {
 // first field after it).
 constexpr int kStartTimeFieldAfterName = 22 - 3;
 
-// Reads /proc/<process>/<name>; process is a pid or "self".
-std::optional<std::string> readProcFile(const std::string& process, std::string_view name) {
-  const std::string path = "/proc/" + process + "/" + std::string(name);
-  const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-  if (fd < 0) return std::nullopt;
-  std::string text;
-  char buffer[4096];
-  for (;;) {
-    const ssize_t n = ::read(fd, buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) {
-      ::close(fd);
-      if (n < 0) return std::nullopt;
-      return text;
-    }
-    text.append(buffer, static_cast<size_t>(n));
-  }
-}
-
 std::optional<uint64_t> parseNumber(std::string_view text) {
   while (!text.empty() && (text.front() == ' ' || text.front() == '\t')) text.remove_prefix(1);
   uint64_t number = 0;
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
   if (error != std::errc() || end == text.data()) return std::nullopt;
   return number;
-}
-
-// The value after "<key>:" on the line starting with it, up to the line's end.
-std::optional<std::string_view> statusField(std::string_view status, std::string_view key) {
-  size_t lineStart = 0;
-  while (lineStart < status.size()) {
-    size_t lineEnd = status.find('\n', lineStart);
-    if (lineEnd == std::string_view::npos) lineEnd = status.size();
-    const std::string_view line = status.substr(lineStart, lineEnd - lineStart);
-    if (line.size() > key.size() && line.starts_with(key) && line[key.size()] == ':') {
-      return line.substr(key.size() + 1);
-    }
-    lineStart = lineEnd + 1;
-  }
-  return std::nullopt;
 }
 
 std::optional<uint64_t> seccompFilterCountOf(const std::string& process) {

@@ -12,38 +12,11 @@
 #include <fmt/format.h>
 
 #include "platform/relay/ProcessStartTime.h"
+#include "platform/sandbox/ProcFiles.h"
 #include "platform/warden/WardenError.h"
 
 namespace warden {
 namespace {
-
-std::optional<std::string> readFile(const std::string& path) {
-  const relay::UniqueFd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!fd.valid()) return std::nullopt;
-  std::string text;
-  char buffer[4096];
-  for (;;) {
-    const ssize_t n = ::read(fd.get(), buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0) return std::nullopt;
-    if (n == 0) return text;
-    text.append(buffer, static_cast<std::size_t>(n));
-  }
-}
-
-// The text after "<key>:" on its line.
-std::optional<std::string_view> field(std::string_view status, std::string_view key) {
-  for (std::size_t start = 0; start < status.size();) {
-    std::size_t end = status.find('\n', start);
-    if (end == std::string_view::npos) end = status.size();
-    const std::string_view line = status.substr(start, end - start);
-    if (line.size() > key.size() && line.starts_with(key) && line[key.size()] == ':') {
-      return line.substr(key.size() + 1);
-    }
-    start = end + 1;
-  }
-  return std::nullopt;
-}
 
 // The whitespace-separated numbers of a status field.
 std::optional<std::vector<uint32_t>> numbers(std::string_view text) {
@@ -74,9 +47,9 @@ bool pidfdReportsExit(int pidfd) {
 }  // namespace
 
 std::optional<Credentials> parseStatusCredentials(std::string_view status) {
-  const auto uids = field(status, "Uid");
-  const auto gids = field(status, "Gid");
-  const auto groups = field(status, "Groups");
+  const auto uids = sandbox::statusField(status, "Uid");
+  const auto gids = sandbox::statusField(status, "Gid");
+  const auto groups = sandbox::statusField(status, "Groups");
   if (!uids || !gids || !groups) return std::nullopt;
   const auto uidNumbers = numbers(*uids);
   const auto gidNumbers = numbers(*gids);
@@ -126,7 +99,7 @@ tn::Result<ProcessHandle> ProcessHandle::adoptChild(pid_t pid, relay::UniqueFd p
 bool ProcessHandle::alive() const { return !pidfdReportsExit(pidfd_->get()); }
 
 tn::Result<Credentials> ProcessHandle::credentials() const {
-  const std::optional<std::string> status = readFile(fmt::format("/proc/{}/status", pid_));
+  const std::optional<std::string> status = sandbox::readProcFile(std::to_string(pid_), "status");
   // Checked after the read: while the pidfd shows the process alive and the
   // start time is unchanged, the status read was its own.
   if (!alive() || relay::processStartTime(pid_) != startTime_) {

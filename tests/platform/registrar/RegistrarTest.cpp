@@ -370,7 +370,7 @@ TEST(RegistrarStore, AReadThatFailsPartWayIsAnError) {
   const auto size = std::filesystem::file_size(path);
   ASSERT_GT(size, 200000u);
   {
-    std::fstream file(path, std::ios::in | std::ios::out | std::ios::binary);
+    std::fstream file(path, std::fstream::in | std::fstream::out | std::fstream::binary);
     for (std::uintmax_t page = size / 2 / 4096; page < size / 4096 - 1; page += 3) {
       file.seekp(static_cast<std::streamoff>(page * 4096));
       file.write(std::string(4096, '\xee').data(), 4096);

@@ -93,6 +93,10 @@ class TNPlugInCore {
   Value plugInDictionary() const { return plugInDictionary_.get(); }
   void setPlugInDictionary(Value value) { plugInDictionary_.set(std::move(value)); }
   std::optional<std::string> identifier() const { return identifier_.get(); }
+  // The identifier and the UUID as log lines and messages show them:
+  // "(null)" when there is none.
+  std::string identifierText() const { return identifier().value_or("(null)"); }
+  std::string uuidText() const { return uuid() ? uuid()->string() : std::string("(null)"); }
   void setIdentifier(std::optional<std::string> value) { identifier_.set(std::move(value)); }
   virtual std::optional<std::string> originalIdentifier() const { return originalIdentifier_.get(); }
   void setOriginalIdentifier(std::optional<std::string> value) { originalIdentifier_.set(std::move(value)); }

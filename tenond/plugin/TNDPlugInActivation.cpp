@@ -61,8 +61,8 @@ tn::Dictionary TNDPlugIn::mergedEnvironment(const std::optional<tn::Dictionary>&
     environment.set("BNFIXED_USER_HOME", container->path());
     environment.set("TMPDIR", container->path() + "/tmp");
   } else {
-    TN_LOG_DEBUG(tn::log::ops(), "no data container for plug-in {}({}) {} at {}", describeText(identifier()),
-                 version().description(), uuid() ? uuid()->string() : "(null)", describeText(path()));
+    TN_LOG_DEBUG(tn::log::ops(), "no data container for plug-in {}({}) {} at {}", identifierText(),
+                 version().description(), uuidText(), describeText(path()));
   }
   return environment;
 }
@@ -87,8 +87,8 @@ tn::Value TNDPlugIn::activationOverlay(const std::optional<tn::Dictionary>& host
   service.set(kEnvironmentVariablesKey, tn::Value(std::move(environment)));
   service.set(kSandboxProfileKey, tn::Value(profile));
   service.set(kOmitSandboxParametersKey, tn::Value(true));
-  TN_LOG_INFO(tn::log::ops(), "assigning plug-in {}({}) {} to {} sandbox", describeText(identifier()),
-              version().description(), uuid() ? uuid()->string() : "(null)", profile);
+  TN_LOG_INFO(tn::log::ops(), "assigning plug-in {}({}) {} to {} sandbox", identifierText(),
+              version().description(), uuidText(), profile);
   tn::Dictionary overlay;
   overlay.set(std::string(kRelayServiceKey), tn::convertMemoryToMessage(tn::Value(std::move(service))));
   overlay.set(kBundlePackageTypeKey, tn::Value(kRelayPackageType));
@@ -99,39 +99,38 @@ std::optional<tn::Error> TNDPlugIn::enableForClient(const TNDHost& host,
                                                     const std::optional<tn::Dictionary>& environment,
                                                     const ExternalServiceRegistrar& registrar) const {
   const tn::Value overlay = activationOverlay(environment);
-  const std::string uuidText = uuid() ? uuid()->string() : "(null)";
   TN_LOG_DEFAULT(tn::log::ops(), "allowing host {} {} to use plug-in {}({}) uuid={} at {}", host.pid(),
-                 host.executablePath(), describeText(identifier()), version().description(), uuidText,
+                 host.executablePath(), identifierText(), version().description(), uuidText(),
                  describeText(path()));
   const std::shared_ptr<tn::TNBundle> bundle = url() ? tn::TNBundle::withURL(*url()) : nullptr;
   const std::optional<std::string> executable = bundle ? bundle->executablePath() : std::nullopt;
   if (!executable) {
-    TN_LOG_ERROR(tn::log::ops(), "failed to obtain execPath for plug-in {}({}) bundle={}", describeText(identifier()),
-                 uuidText, describeText(path()));
+    TN_LOG_ERROR(tn::log::ops(), "failed to obtain execPath for plug-in {}({}) bundle={}", identifierText(),
+                 uuidText(), describeText(path()));
     return tn::Error(std::string(tn::kTenonErrorDomain), 4,
-                     fmt::format("cannot obtain executable path for plug-in {}({})", describeText(identifier()),
-                                 uuidText));
+                     fmt::format("cannot obtain executable path for plug-in {}({})", identifierText(),
+                                 uuidText()));
   }
   TN_LOG_DEBUG(tn::log::ops(), "activation overlay={}", overlay.description());
   if (const int error = registrar(*executable, overlay); error != 0) {
     TN_LOG_ERROR(tn::log::ops(), "warden error {} trying to allow {} {} to use plug-in {}({}) uuid={} at {}", error,
-                 host.pid(), host.executablePath(), describeText(identifier()), version().description(), uuidText,
+                 host.pid(), host.executablePath(), identifierText(), version().description(), uuidText(),
                  describeText(path()));
     return tn::Error(std::string(tn::kTenonErrorDomain), 4,
-                     fmt::format("unable to enable plug-in {}({})", describeText(identifier()), uuidText));
+                     fmt::format("unable to enable plug-in {}({})", identifierText(), uuidText()));
   }
   return std::nullopt;
 }
 
 std::optional<tn::Value> TNDPlugIn::checkBusy(const BusyInstanceSource& busyInstances) const {
   const tn::Value bundleIdentifier = infoKey(tn::keys::kBundleIdentifier);
-  const std::string* identifierText = bundleIdentifier.string();
-  if (identifierText == nullptr) return std::nullopt;
-  for (const tn::Value& instance : busyInstances({*identifierText})) {
+  const std::string* bundle = bundleIdentifier.string();
+  if (bundle == nullptr) return std::nullopt;
+  for (const tn::Value& instance : busyInstances({*bundle})) {
     const tn::Value& busy = instance[kBusyBundleIdentifierKey];
     if (busy.isString()) return tn::Value(tn::Dictionary{{kBusyBundleIdentifierKey, busy}});
-    TN_LOG_ERROR(tn::log::ops(), "vigild reported incomplete bundle for plug-in {}/{}", describeText(identifier()),
-                 uuid() ? uuid()->string() : "(null)");
+    TN_LOG_ERROR(tn::log::ops(), "vigild reported incomplete bundle for plug-in {}/{}", identifierText(),
+                 uuidText());
   }
   return std::nullopt;
 }

@@ -22,11 +22,6 @@ namespace {
 
 const char* const kBadAnnotations = "invalid request format (bad annotations dictionary)";
 
-std::string identifierOf(const TNDPlugIn& plugIn) { return plugIn.identifier().value_or("(null)"); }
-std::string uuidOf(const TNDPlugIn& plugIn) {
-  return plugIn.uuid() ? plugIn.uuid()->string() : std::string("(null)");
-}
-
 // The change "annotate" applies: `election` (a number) and `extension` (a
 // dictionary) taken from the request's dictionary, any other key ignored.
 // Else the message of the first check that fails. An extension the
@@ -89,10 +84,10 @@ void Transaction::annotatePlugIns() {
   const tn::Value described(change);
   const bool walked = processUuidList([&](const std::shared_ptr<TNDPlugIn>& plugIn) {
     TN_LOG_DEBUG(tn::log::ops(), "client {} plug-in {}({}) annotation change: {}", client_->pid(),
-                 identifierOf(*plugIn), uuidOf(*plugIn), described);
+                 plugIn->identifierText(), plugIn->uuidText(), described);
     if (const tn::Value* election = change.find("election")) {
-      TN_LOG_INFO(tn::log::ops(), "client {} plug-in {}({}) election := {}", client_->pid(), identifierOf(*plugIn),
-                  uuidOf(*plugIn), *election);
+      TN_LOG_INFO(tn::log::ops(), "client {} plug-in {}({}) election := {}", client_->pid(), plugIn->identifierText(),
+                  plugIn->uuidText(), *election);
     }
     if (std::optional<tn::Error> refused = storeAnnotation(change, *plugIn)) {
       fail(kErrorInvalidRequest, refused->message());
@@ -126,7 +121,7 @@ void Transaction::bulkAnnotatePlugIns() {
       return;
     }
     TN_LOG_DEBUG(tn::log::ops(), "client {} bulk plug-in {}({}) annotation change: {}", client_->pid(),
-                 identifierOf(*plugIn), uuidOf(*plugIn), value);
+                 plugIn->identifierText(), plugIn->uuidText(), value);
     // Only `extension` is replaced; the stored election stays.
     if (std::optional<tn::Error> refused = storeAnnotation(tn::Dictionary{{"extension", value}}, *plugIn)) {
       fail(kErrorBadValue, refused->message());

@@ -14,8 +14,6 @@ namespace {
 
 namespace formkeys = tn::formkeys;
 
-std::string uuidText(const TNDPlugIn& plugIn) { return plugIn.uuid() ? plugIn.uuid()->string() : "(null)"; }
-
 StepVerdict pass(std::string step, std::string reason) { return StepVerdict{std::move(step), true, std::move(reason), {}}; }
 StepVerdict refuse(std::string step, std::string reason) {
   return StepVerdict{std::move(step), false, std::move(reason), {}};
@@ -67,7 +65,7 @@ std::vector<PlugInPtr> Discovery::preferBundleRelative(std::vector<PlugInPtr> ca
     }
     const std::string preferred = found->second->path().value_or("");
     if (log_) {
-      TN_LOG_INFO(tn::log::ops(), "Ignoring {} @ '{}' in favor of bundle-relative '{}'", uuidText(*candidate),
+      TN_LOG_INFO(tn::log::ops(), "Ignoring {} @ '{}' in favor of bundle-relative '{}'", candidate->uuidText(),
                   candidate->path().value_or(""), preferred);
     }
     if (trace && candidate->uuid() == trace->subject) {
@@ -170,13 +168,13 @@ std::optional<StepVerdict> Discovery::firstRefusal(const TNDPlugIn& plugIn) cons
   }
   if (!plugIn.match(rules_, context_)) return refuse("rules", "it does not match the rules");
   if (StepVerdict excluded = exclusions(plugIn); !excluded.passed) {
-    if (log_) TN_LOG_INFO(tn::log::ops(), "client {} plugin {} globally excluded", hostPid(), uuidText(plugIn));
+    if (log_) TN_LOG_INFO(tn::log::ops(), "client {} plugin {} globally excluded", hostPid(), plugIn.uuidText());
     return excluded;
   }
   if (!discoverAll()) {
     if (StepVerdict allowed = hostAuthorization(plugIn); !allowed.passed) {
       if (log_) {
-        TN_LOG_INFO(tn::log::ops(), "client {} cannot use plugin {}: {}", hostPid(), uuidText(plugIn),
+        TN_LOG_INFO(tn::log::ops(), "client {} cannot use plugin {}: {}", hostPid(), plugIn.uuidText(),
                     allowed.reason);
       }
       return allowed;
@@ -199,7 +197,7 @@ tn::Array Discovery::run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trac
     tn::Result<tn::Dictionary> form = candidate->exportForm();
     if (!form.ok()) {
       if (log_) {
-        TN_LOG_ERROR(tn::log::ops(), "failed to export matching plug-in {}: {}", uuidText(*candidate),
+        TN_LOG_ERROR(tn::log::ops(), "failed to export matching plug-in {}: {}", candidate->uuidText(),
                      form.error().description());
       }
       if (traced) trace->verdicts.push_back(refuse("export", form.error().localizedDescription()));
@@ -241,12 +239,12 @@ bool Discovery::reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& r
     const int order = mine && theirs ? tn::compareVersionString(*mine, *theirs) : 0;
     if (order != 0 && allVersions) continue;  // another version: both stay
     const bool wins = order > 0 || (order == 0 && preferredOver(plugIn, earlier.form));
-    const std::string other = uuidText(*earlier.plugIn);
+    const std::string other = earlier.plugIn->uuidText();
     if (traced) {
       trace->verdicts.push_back(wins ? pass("duplicates", "preferred to " + other + ", which it replaces")
                                      : refuse("duplicates", "another copy is preferred: " + other));
     } else if (trace && earlier.plugIn->uuid() == trace->subject && wins) {
-      trace->verdicts.push_back(refuse("duplicates", "another copy is preferred: " + uuidText(plugIn)));
+      trace->verdicts.push_back(refuse("duplicates", "another copy is preferred: " + plugIn.uuidText()));
     }
     if (!wins) return false;
     earlier.dropped = true;
@@ -293,7 +291,7 @@ void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* t
                   result.form.get(formkeys::kUUID).description());
     }
     if (trace && result.plugIn->uuid() == trace->subject) {
-      trace->verdicts.push_back(pass("replacement", "replaced by " + uuidText(*overrider.plugIn) + " (overrider)"));
+      trace->verdicts.push_back(pass("replacement", "replaced by " + overrider.plugIn->uuidText() + " (overrider)"));
     }
     if (trace && overrider.plugIn->uuid() == trace->subject) {
       trace->verdicts.push_back(pass("replacement", "replaces " + *identifier + " (overriding)"));

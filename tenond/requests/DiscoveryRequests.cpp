@@ -21,8 +21,7 @@ std::string describeCandidates(const std::vector<PlugInPtr>& candidates) {
   std::string text = "(";
   for (const PlugInPtr& plugIn : candidates) {
     if (text.size() > 1) text += ", ";
-    text += fmt::format("{}({}) {}", plugIn->identifier().value_or("(null)"), plugIn->version().description(),
-                        plugIn->uuid() ? plugIn->uuid()->string() : "(null)");
+    text += fmt::format("{}({}) {}", plugIn->identifierText(), plugIn->version().description(), plugIn->uuidText());
   }
   return text + ")";
 }

@@ -13,8 +13,7 @@ namespace tnd {
 namespace {
 
 std::string describe(const TNDPlugIn& plugIn) {
-  return fmt::format("{} {} {}", plugIn.identifier().value_or("(null)"),
-                     plugIn.uuid() ? plugIn.uuid()->string() : std::string("(null)"), plugIn.path().value_or(""));
+  return fmt::format("{} {} {}", plugIn.identifierText(), plugIn.uuidText(), plugIn.path().value_or(""));
 }
 
 // The `paths` array that may stand in for unknown UUIDs: only one with as
@@ -112,7 +111,7 @@ void Transaction::findPlugIn() {
     form = std::move(*exported);
   } else {
     TN_LOG_ERROR(tn::log::ops(), "failed to export matching plug-in {}: {}",
-                 plugIn->uuid() ? plugIn->uuid()->string() : std::string("(null)"), exported.error().description());
+                 plugIn->uuidText(), exported.error().description());
   }
   addAnnotationForPlugIn(*plugIn, form);
   plugIn->augmentForm(form);

@@ -27,9 +27,6 @@ namespace {
 
 constexpr const char* kProvideEnvironmentEntitlement = "com.ostrel.developer.tenon.provide-environment";
 
-std::string identifierOf(const TNDPlugIn& plugIn) { return plugIn.identifier().value_or("(null)"); }
-std::string uuidOf(const TNDPlugIn& plugIn) { return plugIn.uuid() ? plugIn.uuid()->string() : "(null)"; }
-
 }  // namespace
 
 std::optional<std::optional<tn::Dictionary>> Transaction::readyEnvironment() {
@@ -51,19 +48,19 @@ void Transaction::readyPlugIns() {
   if (!environment) return;
   std::vector<std::shared_ptr<TNDPlugIn>> toEnable;  // a set, in the order first named
   const bool walked = processUuidList([&](const std::shared_ptr<TNDPlugIn>& plugIn) {
-    TN_PROBE_PLUGIN_READY(uuidOf(*plugIn).c_str());
+    TN_PROBE_PLUGIN_READY(plugIn->uuidText().c_str());
     if (plugIn->uuid() && server()->holdOnPlugIn(*plugIn->uuid())) {
       TN_LOG_DEFAULT(tn::log::ops(), "denied access to {} for plugin {}({}): the plug-in is on hold", client_->pid(),
-                     identifierOf(*plugIn), uuidOf(*plugIn));
+                     plugIn->identifierText(), plugIn->uuidText());
       fail(kErrorNotPermitted,
-           fmt::format("access to plugin {} denied: the plug-in is on hold", identifierOf(*plugIn)));
+           fmt::format("access to plugin {} denied: the plug-in is on hold", plugIn->identifierText()));
       return false;
     }
     if (plugIn->isData()) return true;
     if (const std::optional<std::string> refusal = plugIn->allowForClient(*client_)) {
       TN_LOG_DEFAULT(tn::log::ops(), "denied access to {} for plugin {}({}): {}", client_->pid(),
-                     identifierOf(*plugIn), uuidOf(*plugIn), *refusal);
-      fail(kErrorNotPermitted, fmt::format("access to plugin {} denied: {}", identifierOf(*plugIn), *refusal));
+                     plugIn->identifierText(), plugIn->uuidText(), *refusal);
+      fail(kErrorNotPermitted, fmt::format("access to plugin {} denied: {}", plugIn->identifierText(), *refusal));
       return false;
     }
     if (std::find(toEnable.begin(), toEnable.end(), plugIn) == toEnable.end()) toEnable.push_back(plugIn);

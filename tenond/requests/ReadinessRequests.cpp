@@ -10,7 +10,7 @@
 
 #include <fmt/format.h>
 
-#include <algorithm>
+#include <unordered_set>
 
 #include "libtenon/model/TNSandboxExtension.h"
 #include "platform/log/Log.h"
@@ -46,7 +46,10 @@ std::optional<std::optional<tn::Dictionary>> Transaction::readyEnvironment() {
 void Transaction::readyPlugIns() {
   const std::optional<std::optional<tn::Dictionary>> environment = readyEnvironment();
   if (!environment) return;
-  std::vector<std::shared_ptr<TNDPlugIn>> toEnable;  // a set, in the order first named
+  // A set in the order first named; the index keeps a request naming many
+  // plug-ins from costing a square on the service queue.
+  std::vector<std::shared_ptr<TNDPlugIn>> toEnable;
+  std::unordered_set<const TNDPlugIn*> named;
   const bool walked = processUuidList([&](const std::shared_ptr<TNDPlugIn>& plugIn) {
     TN_PROBE_PLUGIN_READY(plugIn->uuidText().c_str());
     if (plugIn->uuid() && server()->holdOnPlugIn(*plugIn->uuid())) {
@@ -63,7 +66,7 @@ void Transaction::readyPlugIns() {
       fail(kErrorNotPermitted, fmt::format("access to plugin {} denied: {}", plugIn->identifierText(), *refusal));
       return false;
     }
-    if (std::find(toEnable.begin(), toEnable.end(), plugIn) == toEnable.end()) toEnable.push_back(plugIn);
+    if (named.insert(plugIn.get()).second) toEnable.push_back(plugIn);
     return true;
   });
   if (!walked) return;

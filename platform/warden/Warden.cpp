@@ -161,7 +161,7 @@ void Warden::hostEnded(pid_t pid, uint64_t startTime) {
 
 void Warden::removeExternalService(const std::string& bundleIdentifier, const std::string& version,
                                    std::shared_ptr<tn::dispatch::SerialQueue> queue,
-                                   std::function<void(int)> reply) {
+                                   std::function<void(int)> reply, std::optional<uid_t> onlyForUser) {
   auto removal = std::make_shared<Removal>();
   removal->queue = std::move(queue);
   removal->reply = std::move(reply);
@@ -170,7 +170,7 @@ void Warden::removeExternalService(const std::string& bundleIdentifier, const st
     const std::lock_guard lock(mutex_);
     for (auto& [pid, instance] : instances_) {
       if (instance.registration.bundleIdentifier != bundleIdentifier ||
-          instance.registration.bundleVersion != version) {
+          instance.registration.bundleVersion != version || (onlyForUser && instance.uid != *onlyForUser)) {
         continue;
       }
       instance.onExit.push_back([removal] { removal->instanceExited(); });

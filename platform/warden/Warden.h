@@ -98,9 +98,13 @@ class Warden : public std::enable_shared_from_this<Warden> {
 
   // Terminates the running instances of (bundleIdentifier, version) and
   // calls `reply` once on `queue`: kTerminated once every one has exited,
-  // kNoInstancesRunning at once when none ran. Returns at once.
+  // kNoInstancesRunning at once when none ran. With `onlyForUser`, only the
+  // instances running as that user (started for that user's hosts) are
+  // terminated, and kNoInstancesRunning means none of theirs ran. Returns
+  // at once.
   void removeExternalService(const std::string& bundleIdentifier, const std::string& version,
-                             std::shared_ptr<tn::dispatch::SerialQueue> queue, std::function<void(int)> reply);
+                             std::shared_ptr<tn::dispatch::SerialQueue> queue, std::function<void(int)> reply,
+                             std::optional<uid_t> onlyForUser = std::nullopt);
 
   // Starts, for the host the token names, the plug-in registered for it as
   // `plugIn`: a bundle identifier, or the absolute path of its executable.

@@ -36,7 +36,7 @@ Discovery::Discovery(Request request)
       addAnnotation_(std::move(request.addAnnotation)),
       log_(request.log),
       context_(TNDMatchContext::current()),
-      held_(server_->heldPlugIns()) {
+      held_(server_->heldPlugIns(request.user)) {
   if (const std::shared_ptr<tn::TNBundle> bundle = host_->bundle()) plugInsPath_ = bundle->plugInsPath();
 }
 

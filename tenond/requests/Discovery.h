@@ -15,6 +15,8 @@
 // snapshot of the holds and of the type hierarchy when it is made, so that
 // every candidate is judged against one state of them.
 
+#include <sys/types.h>
+
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -70,6 +72,7 @@ class Discovery {
     // Puts the user's annotation into a form (Transaction::addAnnotationForPlugIn).
     std::function<void(const TNDPlugIn&, tn::Dictionary&)> addAnnotation;
     bool log = true;       // the run's log lines ("explain" runs quietly)
+    uid_t user = 0;        // the requesting client's user: the holds that reach it apply
   };
 
   explicit Discovery(Request request);

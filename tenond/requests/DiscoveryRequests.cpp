@@ -68,6 +68,7 @@ Discovery Transaction::makeDiscovery(const DiscoveryInput& input, std::shared_pt
   request.exclusions = server()->userPrefs().exclusions().value_or(tn::Value());
   request.addAnnotation = [this](const TNDPlugIn& plugIn, tn::Dictionary& form) { addAnnotationForPlugIn(plugIn, form); };
   request.log = log;
+  request.user = client_->peerIdentity().auditToken.uid;
   return Discovery(std::move(request));
 }
 

@@ -52,7 +52,7 @@ void Transaction::readyPlugIns() {
   std::unordered_set<const TNDPlugIn*> named;
   const bool walked = processUuidList([&](const std::shared_ptr<TNDPlugIn>& plugIn) {
     TN_PROBE_PLUGIN_READY(plugIn->uuidText().c_str());
-    if (plugIn->uuid() && server()->holdOnPlugIn(*plugIn->uuid())) {
+    if (plugIn->uuid() && server()->holdOnPlugIn(*plugIn->uuid(), client_->peerIdentity().auditToken.uid)) {
       TN_LOG_DEFAULT(tn::log::ops(), "denied access to {} for plugin {}({}): the plug-in is on hold", client_->pid(),
                      plugIn->identifierText(), plugIn->uuidText());
       fail(kErrorNotPermitted,

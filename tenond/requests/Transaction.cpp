@@ -14,15 +14,13 @@
 
 namespace tnd {
 
-// The request types, tested in this order by exact byte equality. Types
-// whose operations the daemon does not serve yet answer "unrecognized
-// request" until they do.
+// The request types, tested in this order by exact byte equality.
 const Transaction::Route Transaction::kRoutes[] = {
     {"add", &Transaction::addPlugIns},     {"remove", &Transaction::removePlugIns},
     {"bulk", &Transaction::bulkPlugIns},   {"match", &Transaction::matchPlugIns},
     {"ready", &Transaction::readyPlugIns}, {"access", &Transaction::accessPlugIns},
     {"annotate", &Transaction::annotatePlugIns}, {"bulk-annotate", &Transaction::bulkAnnotatePlugIns},
-    {"lock", &Transaction::unrecognized},  {"find", &Transaction::findPlugIn},
+    {"lock", &Transaction::lockDownPlugIns}, {"find", &Transaction::findPlugIn},
     // Tenon's own, beyond the ten request types: why a plug-in is or is not
     // offered to a host.
     {"explain", &Transaction::explainPlugIn},

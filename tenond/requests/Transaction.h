@@ -9,11 +9,14 @@
 // and processUuidList() send their own failure replies; a per-path or
 // per-plug-in operation that answers false must have sent one itself.
 
+#include <sys/types.h>
+
 #include <cstdint>
 #include <functional>
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/relay/Connection.h"
 #include "platform/value/Error.h"
@@ -43,7 +46,9 @@ enum : uint64_t {
 
 inline constexpr uint64_t kCurrentProtocolVersion = 3;
 
-class Transaction {
+// Owned by a shared pointer: a request that answers later ("lock" with
+// termination) keeps its transaction alive until it replies.
+class Transaction : public std::enable_shared_from_this<Transaction> {
  public:
   // (path, resolved) → keep walking?
   using PathOperation = std::function<bool(const std::string& path, bool resolved)>;
@@ -142,6 +147,18 @@ class Transaction {
   // Registers plug-ins with the process supervisor for this client
   // (TNDPlugIn::ExternalServiceRegistrar).
   std::function<int(const std::string& executablePath, const tn::Value& overlay)> registrarForClient() const;
+  // Hold requests (HoldRequests.cpp): "lock".
+  void lockDownPlugIns();
+  // The plug-ins the hold form's `paths` name (applications' plug-ins, or
+  // with TNHoldPlugInPaths the plug-ins themselves); none when the request
+  // failed (9 for a path that does not resolve or holds no plug-in).
+  std::optional<std::vector<std::shared_ptr<TNDPlugIn>>> plugInsToHold(uint64_t flags);
+  // With a busy plug-in among them: replies 14 with the busy reports in
+  // `conflicts` and answers true.
+  bool refuseWhenBusy(const std::vector<std::shared_ptr<TNDPlugIn>>& plugIns);
+  // The users a hold or termination by this client reaches: every user
+  // (none) for a privileged client, else the client's own.
+  std::optional<uid_t> holdReach() const;
   // Annotation requests (AnnotationRequests.cpp).
   void annotatePlugIns();
   void bulkAnnotatePlugIns();

@@ -4,11 +4,13 @@
 
 namespace tnd {
 
-TNDPlugInHold::TNDPlugInHold(const std::vector<tn::UUID>& plugIns, std::weak_ptr<TNDRelayClient> client)
+TNDPlugInHold::TNDPlugInHold(const std::vector<tn::UUID>& plugIns, std::weak_ptr<TNDRelayClient> client,
+                             std::optional<uid_t> onlyForUser)
     : uuid_(tn::UUID::random()),
       blocked_(plugIns.begin(), plugIns.end()),
-      client_(client),
-      created_(tn::Date::now()) {
+      client_(std::move(client)),
+      created_(tn::Date::now()),
+      onlyForUser_(onlyForUser) {
   relay::transactionBegin();
 }
 

@@ -4,8 +4,16 @@
 // held plug-ins launchable and leaves them out of discovery. Each hold keeps
 // the daemon from being idle (one unit of the relay keep-alive count) for its
 // whole life.
+//
+// Reach: a hold placed by a privileged user (root, or a user named in
+// tenond.manifest) holds the plug-ins for every user; one placed by anybody
+// else holds them for that user's hosts only, so that one user cannot stop
+// another's use of plug-ins (docs/holds.md).
+
+#include <sys/types.h>
 
 #include <memory>
+#include <optional>
 #include <unordered_set>
 #include <vector>
 
@@ -19,15 +27,20 @@ class TNDRelayClient;
 class TNDPlugInHold {
  public:
   // A new hold with a fresh random token on the plug-ins named by their
-  // UUIDs (duplicates collapse), placed by `client` (kept weakly).
-  TNDPlugInHold(const std::vector<tn::UUID>& plugIns, std::weak_ptr<TNDRelayClient> client);
+  // UUIDs (duplicates collapse), placed by `client` (kept weakly), for the
+  // hosts of `onlyForUser` (none: of every user).
+  TNDPlugInHold(const std::vector<tn::UUID>& plugIns, std::weak_ptr<TNDRelayClient> client,
+                std::optional<uid_t> onlyForUser = std::nullopt);
   ~TNDPlugInHold();
 
   TNDPlugInHold(const TNDPlugInHold&) = delete;
   TNDPlugInHold& operator=(const TNDPlugInHold&) = delete;
 
   const tn::UUID& uuid() const { return uuid_; }
-  bool blocks(const tn::UUID& plugIn) const { return blocked_.count(plugIn) != 0; }
+  // True when the hold keeps `plugIn` from the hosts of `user`.
+  bool blocks(const tn::UUID& plugIn, uid_t user) const { return reaches(user) && blocked_.count(plugIn) != 0; }
+  bool reaches(uid_t user) const { return !onlyForUser_ || *onlyForUser_ == user; }
+  const std::optional<uid_t>& onlyForUser() const { return onlyForUser_; }
   size_t blockedCount() const { return blocked_.size(); }
   const std::unordered_set<tn::UUID>& blocked() const { return blocked_; }
   // The client, or none once it has been destroyed.
@@ -45,6 +58,7 @@ class TNDPlugInHold {
   const std::unordered_set<tn::UUID> blocked_;
   const std::weak_ptr<TNDRelayClient> client_;
   const tn::Date created_;
+  const std::optional<uid_t> onlyForUser_;
 };
 
 }  // namespace tnd

@@ -10,6 +10,7 @@
 #include "platform/types/TypeHierarchy.h"
 #include "tenond/QueueRanks.h"
 #include "tenond/server/FileLimit.h"
+#include "tenond/server/PlugInTermination.h"
 #include "tenond/server/TNDPlugInHold.h"
 #include "tenond/server/TNDRelayClient.h"
 
@@ -133,25 +134,34 @@ void TNDServer::stop() {
   postAnnotationChanges(1);  // one, even with no holds
 }
 
-bool TNDServer::holdOnPlugIn(const tn::UUID& plugIn) {
+bool TNDServer::holdOnPlugIn(const tn::UUID& plugIn, uid_t user) {
   return syncQueue_->sync([&] {
     for (const auto& hold : holds_)
-      if (hold->blocks(plugIn)) return true;
+      if (hold->blocks(plugIn, user)) return true;
     return false;
   });
 }
 
-std::unordered_set<tn::UUID> TNDServer::heldPlugIns() {
+std::unordered_set<tn::UUID> TNDServer::heldPlugIns(uid_t user) {
   return syncQueue_->sync([&] {
     std::unordered_set<tn::UUID> held;
-    for (const auto& hold : holds_) held.insert(hold->blocked().begin(), hold->blocked().end());
+    for (const auto& hold : holds_)
+      if (hold->reaches(user)) held.insert(hold->blocked().begin(), hold->blocked().end());
     return held;
   });
 }
 
-void TNDServer::addHold(std::shared_ptr<TNDPlugInHold> hold) {
-  syncQueue_->sync([&] { holds_.push_back(std::move(hold)); });
-  postAnnotationChanges(1);
+bool TNDServer::addHold(std::shared_ptr<TNDPlugInHold> hold) {
+  const bool added = syncQueue_->sync([&] {
+    if (const std::shared_ptr<TNDRelayClient> client = hold->client()) {
+      const auto placed = [&](const auto& held) { return held->placedBy(client); };
+      if (static_cast<size_t>(std::count_if(holds_.begin(), holds_.end(), placed)) >= kHoldsPerClient) return false;
+    }
+    holds_.push_back(std::move(hold));
+    return true;
+  });
+  if (added) postAnnotationChanges(1);
+  return added;
 }
 
 void TNDServer::unholdToken(const tn::UUID& token) {
@@ -184,12 +194,22 @@ size_t TNDServer::holdCount() {
   return syncQueue_->sync([&] { return holds_.size(); });
 }
 
+void TNDServer::terminatePlugIns(const registrar::PlugInList& records, std::function<void()> completion,
+                                 std::optional<uid_t> onlyForUser) {
+  const std::shared_ptr<warden::Warden> supervisor = warden_;
+  PlugInTermination::start(
+      records,
+      [supervisor, onlyForUser](const std::string& identifier, const std::string& version,
+                                std::shared_ptr<tn::dispatch::SerialQueue> queue, std::function<void(int)> reply) {
+        supervisor->removeExternalService(identifier, version, std::move(queue), std::move(reply), onlyForUser);
+      },
+      std::move(completion));
+}
+
 void TNDServer::removedPlugIns(const registrar::PlugInList& records) {
-  // Forced termination of running instances comes with the holds' issue;
-  // until then an uninstall only leaves the cache.
-  for (const registrar::PlugInPtr& record : records)
-    TN_LOG_DEBUG(tn::log::ops(), "plug-in {} removed; terminating its instances is not available yet",
-                 record->identifier());
+  terminatePlugIns(records, [description = PlugInTermination::describe(records)] {
+    TN_LOG_DEBUG(tn::log::ops(), "removal complete for {}", description);
+  });
 }
 
 }  // namespace tnd

@@ -70,18 +70,31 @@ class TNDServer final : public TNDatabase,
 
   // Holds. All of them enter "serverSync" synchronously; those that change
   // the list post one annotation-change notification per hold added or
-  // released, after leaving "serverSync".
-  bool holdOnPlugIn(const tn::UUID& plugIn);
-  // Every plug-in some hold blocks now: one visit to "serverSync" for a
-  // request that asks about many plug-ins.
-  std::unordered_set<tn::UUID> heldPlugIns();
-  void addHold(std::shared_ptr<TNDPlugInHold> hold);
+  // released, after leaving "serverSync". A hold blocks a plug-in for the
+  // users it reaches (TNDPlugInHold).
+  static constexpr size_t kHoldsPerClient = 64;
+  bool holdOnPlugIn(const tn::UUID& plugIn, uid_t user);
+  // Every plug-in some hold blocks for `user` now: one visit to
+  // "serverSync" for a request that asks about many plug-ins.
+  std::unordered_set<tn::UUID> heldPlugIns(uid_t user);
+  // Adds the hold, unless its client already has kHoldsPerClient holds
+  // (false: nothing added, nothing posted). A client's holds are few and
+  // end with its connection, so this bounds what one client can make the
+  // daemon keep.
+  bool addHold(std::shared_ptr<TNDPlugInHold> hold);
   void unholdToken(const tn::UUID& token);
   void unholdClient(const std::shared_ptr<TNDRelayClient>& client);
   size_t holdCount();
 
-  // TNDatabaseDelegate. Terminating the running instances of removed
-  // plug-ins comes with the supervisor; for now the removal is logged.
+  // Terminates the running instances of the records' plug-ins through the
+  // supervisor (PlugInTermination) and runs `completion` on the call's own
+  // "killer-waiter" queue once every answer has come. With `onlyForUser`,
+  // only instances running as that user are terminated. Returns at once.
+  void terminatePlugIns(const registrar::PlugInList& records, std::function<void()> completion,
+                        std::optional<uid_t> onlyForUser = std::nullopt);
+
+  // TNDatabaseDelegate: the running instances of uninstalled plug-ins are
+  // terminated, for every user; holds stay as they are.
   void removedPlugIns(const registrar::PlugInList& records) override;
 
   uint32_t verbose() const { return verbose_; }

@@ -73,10 +73,10 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
     EXPECT_EQ(result.exitStatus, 0) << result.err;
     EXPECT_EQ(result.out, "no plug-ins offered\n");
   }
-  const auto release = tnctl({"release", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"});
-  EXPECT_EQ(release.exitStatus, 1);
-  EXPECT_EQ(release.err, "tnctl: error 4: unrecognized request\n");
-  EXPECT_EQ(release.out, "");
+  const auto unknownType = tnctl({"request", R"({"version":3,"request":"unlock"})"});
+  EXPECT_EQ(unknownType.exitStatus, 1);
+  EXPECT_EQ(unknownType.err, "tnctl: error 4: unrecognized request\n");
+  EXPECT_EQ(unknownType.out, "");
   EXPECT_EQ(tnctl({"find", "--uuid", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"}).err,
             "tnctl: error 15: Cannot locate PlugIn\n");
   const auto added = tnctl({"add", "/opt/A.tnx"});
@@ -86,12 +86,12 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
 }
 
 TEST_F(TnctlClient, JsonOutputIsTheReplyAsADocument) {
-  const auto result = tnctl({"--json", "release", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"});
+  const auto result = tnctl({"--json", "find", "--uuid", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"});
   EXPECT_EQ(result.exitStatus, 1);
   auto reply = readDocument(result.out, "stdout", DocumentEncoding::Json);
   ASSERT_TRUE(reply) << reply.error().localizedDescription() << "\n" << result.out;
-  EXPECT_EQ((*reply)["errorcode"], Value(4));
-  EXPECT_EQ((*reply)["error"], Value("unrecognized request"));
+  EXPECT_EQ((*reply)["errorcode"], Value(15));
+  EXPECT_EQ((*reply)["error"], Value("Cannot locate PlugIn"));
   EXPECT_EQ(lineCount(result.err), 1u) << result.err;
 }
 

@@ -243,16 +243,41 @@ TEST_F(Server, ADeadClientLosesEveryHoldWithOneLineAndOneNotificationEach) {
   EXPECT_EQ(annotationChanges(), before + 3);
 }
 
-TEST_F(Server, HoldsBlockTheirPlugInsUntilReleased) {
+TEST_F(Server, HoldsBlockTheirPlugInsForTheUsersTheyReachUntilReleased) {
   Pair pair = connect();
   const tn::UUID held = tn::UUID::random(), free = tn::UUID::random();
-  auto hold = std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{held, held}, pair.client);
-  EXPECT_EQ(hold->blockedCount(), 1u);
-  server_->addHold(hold);
-  EXPECT_TRUE(server_->holdOnPlugIn(held));
-  EXPECT_FALSE(server_->holdOnPlugIn(free));
-  server_->unholdToken(hold->uuid());
-  EXPECT_FALSE(server_->holdOnPlugIn(held));
+  auto everyone = std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{held, held}, pair.client);
+  EXPECT_EQ(everyone->blockedCount(), 1u);
+  ASSERT_TRUE(server_->addHold(everyone));
+  EXPECT_TRUE(server_->holdOnPlugIn(held, 1000));
+  EXPECT_TRUE(server_->holdOnPlugIn(held, 0));
+  EXPECT_FALSE(server_->holdOnPlugIn(free, 1000));
+  server_->unholdToken(everyone->uuid());
+  EXPECT_FALSE(server_->holdOnPlugIn(held, 1000));
+
+  // A user's own hold keeps the plug-in from that user's hosts only.
+  auto own = std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{held}, pair.client, uid_t{1000});
+  ASSERT_TRUE(server_->addHold(own));
+  EXPECT_TRUE(server_->holdOnPlugIn(held, 1000));
+  EXPECT_FALSE(server_->holdOnPlugIn(held, 1001));
+  EXPECT_EQ(server_->heldPlugIns(1000), std::unordered_set<tn::UUID>{held});
+  EXPECT_TRUE(server_->heldPlugIns(1001).empty());
+  server_->unholdToken(own->uuid());
+}
+
+TEST_F(Server, AClientKeepsAtMostItsShareOfHolds) {
+  Pair pair = connect();
+  Pair other = connect();
+  const uint64_t before = annotationChanges();
+  for (size_t i = 0; i < TNDServer::kHoldsPerClient; ++i)
+    ASSERT_TRUE(server_->addHold(std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{}, pair.client)));
+  EXPECT_FALSE(server_->addHold(std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{}, pair.client)));
+  EXPECT_EQ(server_->holdCount(), TNDServer::kHoldsPerClient);
+  EXPECT_EQ(annotationChanges(), before + TNDServer::kHoldsPerClient) << "nothing posted for the refused one";
+  EXPECT_TRUE(server_->addHold(std::make_shared<TNDPlugInHold>(std::vector<tn::UUID>{}, other.client)));
+  pair.peer->cancel();
+  other.peer->cancel();
+  ASSERT_TRUE(eventually([&] { return server_->holdCount() == 0; }));
 }
 
 TEST_F(Server, AClientThatNoLongerAcceptsWorkGetsOnlyItsVersionErrors) {

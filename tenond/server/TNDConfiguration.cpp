@@ -22,6 +22,8 @@ namespace {
 constexpr std::string_view kPrivilegedGroups = "privileged-groups";
 constexpr std::string_view kConnectionsPerUser = "connections-per-user";
 constexpr std::string_view kConnectionsTotal = "connections-total";
+constexpr std::string_view kTerminationGrace = "termination-grace-seconds";
+constexpr std::size_t kLongestTerminationGrace = 3600;
 
 void logBadKey(const std::string& path, std::string_view key, std::string_view reason) {
   TN_LOG_ERROR(tn::log::ops(), "configuration {}: \"{}\" {}; using its default", path, key, reason);
@@ -104,6 +106,12 @@ TNDConfiguration TNDConfiguration::fromDocument(const tn::Value& document, const
       configuration.connectionsPerUser = positiveCount(value, key, path);
     } else if (key == kConnectionsTotal) {
       configuration.connectionsTotal = positiveCount(value, key, path);
+    } else if (key == kTerminationGrace) {
+      configuration.terminationGraceSeconds = positiveCount(value, key, path);
+      if (configuration.terminationGraceSeconds > kLongestTerminationGrace) {
+        logBadKey(path, key, fmt::format("is more than {}", kLongestTerminationGrace));
+        configuration.terminationGraceSeconds.reset();
+      }
     } else {
       TN_LOG_ERROR(tn::log::ops(), "configuration {}: unknown key \"{}\" ignored", path, key);
     }

@@ -5,7 +5,8 @@
 // a structured-value document (XML or JSON) holding a dictionary:
 //
 //   {"privileged-groups": ["tenon-admin", 1001],
-//    "connections-per-user": 64, "connections-total": 4096}
+//    "connections-per-user": 64, "connections-total": 4096,
+//    "termination-grace-seconds": 2}
 //
 // docs/configuration.md describes the keys for administrators. The document
 // is read once, when the server is made, and only when it passes the trust
@@ -38,6 +39,9 @@ struct TNDConfiguration {
   std::optional<std::size_t> connectionsPerUser;
   // "connections-total": live connections of all users together; positive.
   std::optional<std::size_t> connectionsTotal;
+  // "termination-grace-seconds": how long a plug-in instance told to stop
+  // (SIGTERM) may take before it is killed; 1 to 3600.
+  std::optional<std::size_t> terminationGraceSeconds;
 
   // The configuration of $TENON_ROOT/etc/tenon/tenond.manifest (see above).
   static TNDConfiguration load();

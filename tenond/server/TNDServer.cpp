@@ -67,7 +67,10 @@ std::shared_ptr<TNDServer> TNDServer::initForService(const std::string& serviceN
 }
 
 void TNDServer::startPlatformServices() {
-  warden_ = warden::Warden::create();
+  warden::Warden::Limits limits;
+  if (configuration_.terminationGraceSeconds)
+    limits.terminationGrace = std::chrono::seconds(*configuration_.terminationGraceSeconds);
+  warden_ = warden::Warden::create(limits);
   const TNDConfiguration configuration = configuration_;
   const auto isPrivileged = [configuration](const relay::PeerIdentity& peer) {
     return configuration.isPrivilegedUser(peer.auditToken);

@@ -3,9 +3,10 @@
 // and writes one answer line per command to the FIFO named by its second:
 //
 //   start <plug-in>   asks the supervisor to start it; "started <pid>" or
-//                     "error <code> <message>"; keeps the socket it got
-//   send <line>       writes the line to the plug-in, answers the plug-in's
-//                     answer line ("closed" when it went away)
+//                     "error <code> <message>"; keeps the socket it got (and
+//                     those of the plug-ins it started before)
+//   send <line>       writes the line to the plug-in started last, answers
+//                     the plug-in's answer line ("closed" when it went away)
 //   ready <service> <uuid>
 //                     asks the daemon (its relay service) to make the plug-in
 //                     ready for this process; "ready" or "error <code> <message>"
@@ -23,13 +24,15 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/dispatch/SerialQueue.h"
 #include "platform/relay/Connection.h"
 
 namespace {
 
-relay::UniqueFd plugInSocket;
+relay::UniqueFd plugInSocket;                  // of the plug-in started last
+std::vector<relay::UniqueFd> earlierSockets;  // kept, so those instances keep running
 
 std::string start(const std::string& plugIn) {
   auto queue = tn::dispatch::SerialQueue::create("host");
@@ -50,6 +53,7 @@ std::string start(const std::string& plugIn) {
     return "error " + std::to_string(*code) + " " + (message ? *message : "");
   }
   if (descriptors.size() != 1) return "error 0 the reply brought " + std::to_string(descriptors.size()) + " descriptors";
+  if (plugInSocket.valid()) earlierSockets.push_back(std::move(plugInSocket));
   plugInSocket = std::move(descriptors[0]);
   return "started " + std::to_string((*reply)["pid"].int64().value_or(0));
 }

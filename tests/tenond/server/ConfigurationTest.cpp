@@ -40,8 +40,10 @@ TEST_F(Configuration, AMissingDocumentMeansDefaults) {
 }
 
 TEST_F(Configuration, ATrustedDocumentGivesEveryKeyGroupsByNameOrNumber) {
-  write(R"({"privileged-groups": ["root", 4242], "connections-per-user": 8, "connections-total": 100})");
+  write(R"({"privileged-groups": ["root", 4242], "connections-per-user": 8, "connections-total": 100,)"
+        R"( "termination-grace-seconds": 30})");
   const TNDConfiguration configuration = TNDConfiguration::load();
+  EXPECT_EQ(configuration.terminationGraceSeconds, 30u);
   EXPECT_EQ(configuration.privilegedGroups, (std::vector<gid_t>{0, 4242}));
   EXPECT_EQ(configuration.connectionsPerUser, 8u);
   EXPECT_EQ(configuration.connectionsTotal, 100u);
@@ -72,8 +74,11 @@ TEST_F(Configuration, AMalformedDocumentIsIgnored) {
 
 // Each bad key falls back to its own default; the good ones still count.
 TEST_F(Configuration, AKeyOfTheWrongTypeGetsItsDefault) {
-  write(R"({"privileged-groups": "wheel", "connections-per-user": 0, "connections-total": 7})");
+  write(R"({"privileged-groups": "wheel", "connections-per-user": 0, "connections-total": 7,)"
+        R"( "termination-grace-seconds": 86400})");
   TNDConfiguration configuration = TNDConfiguration::load();
+  EXPECT_FALSE(configuration.terminationGraceSeconds);
+  EXPECT_TRUE(logged("\"termination-grace-seconds\" is more than 3600"));
   EXPECT_TRUE(configuration.privilegedGroups.empty());
   EXPECT_FALSE(configuration.connectionsPerUser);
   EXPECT_EQ(configuration.connectionsTotal, 7u);

@@ -321,4 +321,17 @@ TEST_F(Holds, UninstallingAnApplicationTerminatesItsRunningPlugInAndLeavesHoldsA
             "error 11 access to plugin com.example.d denied: the plug-in is on hold");
 }
 
+// A hold placed by an ordinary user keeps the plug-ins from that user's own
+// hosts only; another user's hosts still get them.
+TEST_F(Holds, AnOrdinaryUsersHoldReachesOnlyThatUsersHosts) {
+  if (::geteuid() != 0) GTEST_SKIP() << "needs a second user: the host runs as 65534 when the test runs as root";
+  Host host(daemon_.root(), hostUid_);
+  const std::string held = host.command("hold " + daemon_.service() + " 0 " + app(kTools));
+  ASSERT_EQ(held.rfind("held ", 0), 0u) << held << daemon_.log();
+  EXPECT_EQ(ready(host, 0), heldRefusal(0));
+  Client administrator(daemon_.service());
+  const Value readied = administrator.request({{"request", "ready"}, {"uuids", Array{Value(uuids_[0])}}});
+  EXPECT_EQ(readied["errorcode"], Value()) << readied;
+}
+
 }  // namespace

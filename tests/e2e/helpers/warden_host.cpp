@@ -10,6 +10,10 @@
 //   ready <service> <uuid>
 //                     asks the daemon (its relay service) to make the plug-in
 //                     ready for this process; "ready" or "error <code> <message>"
+//   hold <service> <flags> <path>
+//                     asks the daemon to hold the plug-ins at the path
+//                     ("lock"); "held <token>" or "error <code> <message>";
+//                     the connection, and so the hold, stays open until exit
 //   exit              answers "bye" and exits
 //
 // It uses the relay like any host: TENON_ROOT names the platform root.
@@ -82,6 +86,34 @@ std::string ready(const std::string& arguments) {
   return "ready";
 }
 
+std::vector<std::shared_ptr<relay::Connection>> holdingConnections;
+
+std::string hold(const std::string& arguments) {
+  const std::size_t first = arguments.find(' ');
+  const std::size_t second = first == std::string::npos ? first : arguments.find(' ', first + 1);
+  if (second == std::string::npos) return "error 0 usage: hold <service> <flags> <path>";
+  auto queue = tn::dispatch::SerialQueue::create("host");
+  auto connection = relay::Connection::connectToService(arguments.substr(0, first), queue);
+  if (!connection.ok()) return "error 0 " + connection.error().description();
+  (*connection)->setEventHandler([](const relay::Event&) {});
+  (*connection)->resume();
+  std::promise<relay::Reply> promise;
+  (*connection)->sendWithReply(
+      tn::Dictionary{{"request", "lock"}, {"version", 3},
+                     {"flags", std::stoull(arguments.substr(first + 1, second - first - 1), nullptr, 0)},
+                     {"paths", tn::Array{tn::Value(arguments.substr(second + 1))}}},
+      queue, [&](relay::Reply reply) { promise.set_value(std::move(reply)); });
+  relay::Reply reply = promise.get_future().get();
+  holdingConnections.push_back(*connection);
+  if (!reply.ok()) return "error 0 " + reply.error().description();
+  if (const auto code = (*reply)["errorcode"].uint64()) {
+    const std::string* message = (*reply)["error"].string();
+    return "error " + std::to_string(*code) + " " + (message ? *message : "");
+  }
+  const std::optional<tn::UUID> token = (*reply)["uuids"].uuid();
+  return token ? "held " + token->string() : "error 0 no token in the reply";
+}
+
 std::string send(const std::string& line) {
   if (!plugInSocket.valid()) return "closed";
   const std::string text = line + "\n";
@@ -110,6 +142,8 @@ int main(int argc, char** argv) {
       answer = start(line.substr(6));
     } else if (line.rfind("ready ", 0) == 0) {
       answer = ready(line.substr(6));
+    } else if (line.rfind("hold ", 0) == 0) {
+      answer = hold(line.substr(5));
     } else if (line.rfind("send ", 0) == 0) {
       answer = send(line.substr(5));
     } else if (line == "exit") {

@@ -172,10 +172,19 @@ TEST_F(SupervisorTest, StartsOnlyWhatIsRegisteredAndRemovalTerminatesIt) {
   const auto named = tn::dispatch::SerialQueue::create("named");
   std::atomic<int> answers{0};
   std::atomic<int> status{-1};
+  // A removal for another user's instances finds none and leaves this one.
   warden->removeExternalService("com.example.upcase", "1.0", named, [&](int value) {
     status = value;
     ++answers;
-  });
+  }, ::getuid() + 1);
+  ASSERT_TRUE(eventually([&] { return answers > 0; }));
+  EXPECT_EQ(status, kNoInstancesRunning);
+  ASSERT_TRUE(warden->runningInstance(pid, started->instance.startTime));
+  answers = 0;
+  warden->removeExternalService("com.example.upcase", "1.0", named, [&](int value) {
+    status = value;
+    ++answers;
+  }, ::getuid());
   ASSERT_TRUE(eventually([&] { return answers > 0; }));
   EXPECT_EQ(status, kTerminated);
   EXPECT_EQ(warden->instanceCount(), 0u);

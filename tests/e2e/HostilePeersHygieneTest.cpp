@@ -194,6 +194,13 @@ TEST_F(HostileInput, PathsWithANulNameNothing) {
   EXPECT_EQ(removed.err, "tnctl: error 9: no plugin at " + bundle + "\\x00\n");
   EXPECT_FALSE(registered(bundle).empty()) << "still registered";
 
+  // A hold on a path with a NUL holds nothing.
+  Dictionary hold = pathRequest("lock", bundle + "\0"s);
+  hold.set("flags", 1);
+  const Value held = peer.request(hold);
+  EXPECT_EQ(held["errorcode"], Value(9)) << held.description();
+  EXPECT_EQ(held["error"], Value("invalid path: " + bundle + "\\x00"));
+
   for (const std::string& url : {"file://" + bundle + "\0"s, "file://" + bundle + "\0/../Real.tnx"s}) {
     const Value found = peer.request(Dictionary{{"request", Value("find")}, {"version", Value(3)},
                                                 {"paths", Value(url)}});

@@ -64,7 +64,9 @@ void noteHoldEndingSignal(int) {
 // Installed before the request goes out, so that a signal sent as soon as
 // the token is out ends the hold cleanly rather than killing tnctl.
 void catchHoldEndingSignals() {
-  if (::pipe2(holdEndingPipe, O_CLOEXEC | O_NONBLOCK) != 0) fail(fmt::format("cannot make a pipe: {}", std::strerror(errno)));
+  if (::pipe2(holdEndingPipe, O_CLOEXEC) != 0) fail(fmt::format("cannot make a pipe: {}", std::strerror(errno)));
+  // The handler must never block, however many signals come.
+  ::fcntl(holdEndingPipe[1], F_SETFL, ::fcntl(holdEndingPipe[1], F_GETFL) | O_NONBLOCK);
   struct sigaction action {};
   action.sa_handler = noteHoldEndingSignal;
   sigemptyset(&action.sa_mask);
@@ -74,8 +76,6 @@ void catchHoldEndingSignals() {
 
 void awaitHoldEndingSignal() {
   std::fprintf(stderr, "tnctl: holding until SIGINT or SIGTERM\n");
-  const int flags = ::fcntl(holdEndingPipe[0], F_GETFL);
-  ::fcntl(holdEndingPipe[0], F_SETFL, flags & ~O_NONBLOCK);
   char byte = 0;
   while (::read(holdEndingPipe[0], &byte, 1) < 0 && errno == EINTR) {
   }

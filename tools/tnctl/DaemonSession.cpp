@@ -1,6 +1,8 @@
 #include "tools/tnctl/DaemonSession.h"
 
 #include <chrono>
+#include <cstdio>
+#include <functional>
 #include <optional>
 
 #include <fmt/format.h>
@@ -33,46 +35,58 @@ std::optional<tn::Error> errorIn(const relay::Reply& reply) {
   }
 }
 
-}  // namespace
-
-namespace {
-
-void run(const GlobalOptions& options, const ClientOperation& operation, const ReadablePrinter& readable,
-         const std::string& emptySuccess) {
+// Connects, sends the request, waits for its reply and hands it, with the
+// client (whose connection is still open), to `handle`; fails the command
+// when the daemon cannot be reached or does not answer in time.
+void withReply(const GlobalOptions& options, const ClientOperation& operation,
+               const std::function<void(tn::TNDaemonClient&, const relay::Reply& reply)>& handle) {
   tn::TNDaemonClient client(options.service);
   const relay::Reply reply = await(options, operation, client);
   if (!reply) failUnreachable(options, reply.error());
+  handle(client, reply);
+}
 
-  const std::optional<tn::Error> error = errorIn(reply);
-  if (readable && !error && !options.json) {
-    readable(client, *reply);
-  } else {
-    printReply(client, *reply, options.json, /*succeeded=*/!error, emptySuccess);
-  }
-  if (error) fail(fmt::format("error {}: {}", error->code(), error->localizedDescription()));
+[[noreturn]] void failWith(const tn::Error& error) {
+  fail(fmt::format("error {}: {}", error.code(), error.localizedDescription()));
 }
 
 }  // namespace
+
+void runClientOperation(const GlobalOptions& options, const ClientOperation& operation, const ReplyHandling& handling) {
+  withReply(options, operation, [&](tn::TNDaemonClient& client, const relay::Reply& reply) {
+    const std::optional<tn::Error> error = errorIn(reply);
+    const ReadablePrinter& readable = error ? handling.readableFailure : handling.readable;
+    if (readable && !options.json) {
+      readable(client, *reply);
+      std::fflush(stdout);
+    } else {
+      printReply(client, *reply, options.json, /*succeeded=*/!error, handling.emptySuccess);
+    }
+    if (error) failWith(*error);
+    if (handling.whileConnected) handling.whileConnected();
+  });
+}
 
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
                         const std::string& emptySuccess) {
-  run(options, operation, {}, emptySuccess);
-}
-
-void runClientOperationQuietly(const GlobalOptions& options, const ClientOperation& operation,
-                               const ReadablePrinter& succeeded) {
-  tn::TNDaemonClient client(options.service);
-  const relay::Reply reply = await(options, operation, client);
-  if (!reply) failUnreachable(options, reply.error());
-  if (const std::optional<tn::Error> error = errorIn(reply)) {
-    fail(fmt::format("error {}: {}", error->code(), error->localizedDescription()));
-  }
-  succeeded(client, *reply);
+  ReplyHandling handling;
+  handling.emptySuccess = emptySuccess;
+  runClientOperation(options, operation, handling);
 }
 
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
                         const ReadablePrinter& readable) {
-  run(options, operation, readable, "ok");
+  ReplyHandling handling;
+  handling.readable = readable;
+  runClientOperation(options, operation, handling);
+}
+
+void runClientOperationQuietly(const GlobalOptions& options, const ClientOperation& operation,
+                               const ReadablePrinter& succeeded) {
+  withReply(options, operation, [&](tn::TNDaemonClient& client, const relay::Reply& reply) {
+    if (const std::optional<tn::Error> error = errorIn(reply)) failWith(*error);
+    succeeded(client, *reply);
+  });
 }
 
 }  // namespace tnctl

@@ -32,6 +32,20 @@ void runClientOperation(const GlobalOptions& options, const ClientOperation& ope
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
                         const ReadablePrinter& readable);
 
+// How a command shows its reply when the generic printing does not fit,
+// and what it does while its connection is still open. Empty members keep
+// the generic behaviour.
+struct ReplyHandling {
+  ReadablePrinter readable;         // a success, for people
+  ReadablePrinter readableFailure;  // what a failure carried, for people (before the error line)
+  std::string emptySuccess = "ok";  // a success that carries nothing, for people
+  // Runs after a success has been printed and stdout flushed, before the
+  // connection closes: what the daemon ties to the connection (a hold)
+  // lasts until it returns.
+  std::function<void()> whileConnected;
+};
+void runClientOperation(const GlobalOptions& options, const ClientOperation& operation, const ReplyHandling& handling);
+
 // Runs `operation` and hands a successful reply to `succeeded` without
 // printing anything; fails the command as runClientOperation does.
 void runClientOperationQuietly(const GlobalOptions& options, const ClientOperation& operation,

@@ -13,6 +13,8 @@
 #include <cerrno>
 #include <chrono>
 #include <filesystem>
+#include <fstream>
+#include <iterator>
 #include <future>
 #include <memory>
 #include <string>
@@ -180,6 +182,18 @@ class Holds : public ::testing::Test {
     return count ? *count : 0;
   }
   static bool gone(pid_t pid) { return ::kill(pid, 0) == -1 && errno == ESRCH; }
+  // Waits (at most 30 s) until the process's state is "stopped".
+  static bool stopped(pid_t pid) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+    while (std::chrono::steady_clock::now() < deadline) {
+      std::ifstream stat("/proc/" + std::to_string(pid) + "/stat");
+      std::string text((std::istreambuf_iterator<char>(stat)), std::istreambuf_iterator<char>());
+      const size_t state = text.rfind(')');
+      if (state != std::string::npos && text.size() > state + 2 && text[state + 2] == 'T') return true;
+      std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    return false;
+  }
 
   const uid_t hostUid_;
   DaemonProcess daemon_;
@@ -263,7 +277,10 @@ TEST_F(Holds, TerminationRepliesOnceEveryInstanceHasGoneWhileTheHoldIsAlreadyInF
   Host host(daemon_.root(), hostUid_);
   std::vector<pid_t> instances;
   for (size_t i = 0; i < kToolNames.size(); ++i) instances.push_back(startTool(host, i));
-  ASSERT_EQ(::kill(instances[2], SIGSTOP), 0);  // C cannot act on SIGTERM until it is killed
+  // C cannot act on SIGTERM until it is killed, once it has stopped (a
+  // SIGTERM that came before the stop took effect would still end it).
+  ASSERT_EQ(::kill(instances[2], SIGSTOP), 0);
+  ASSERT_TRUE(stopped(instances[2]));
 
   Client holder(daemon_.service());
   std::future<Value> granted = holder.send({{"request", "lock"}, {"paths", Client::pathArray({app(kTools)})},

@@ -30,18 +30,32 @@ std::string describe(const relay::Reply& reply) {
   return reply ? reply->description() : reply.error().description();
 }
 
-// The connection's event handler: every event is reported, nothing else
-// happens (replies go to their blocks, and the relay reconnects by itself
-// after an interruption). The event that the client's own cancel causes at
-// release is not a communications error and stays quiet.
-relay::Connection::EventHandler eventHandler(std::shared_ptr<std::atomic<bool>> releasing) {
-  return [releasing = std::move(releasing)](const relay::Event& event) {
-    if (releasing->load()) return;
+}  // namespace
+
+// The connection's event handler: every event is reported and a broken
+// connection told to the lost handler; nothing else happens (replies go to
+// their blocks, and the relay reconnects by itself after an interruption).
+// The event that the client's own cancel causes at release is not a
+// communications error and stays quiet.
+relay::Connection::EventHandler TNDaemonClient::eventHandler(std::shared_ptr<ConnectionWatch> watch) {
+  return [watch = std::move(watch)](const relay::Event& event) {
+    if (watch->releasing.load()) return;
     TN_LOG_ERROR(log::ops(), "Communications error: {}", describe(event));
+    if (event.kind != relay::Event::Kind::ConnectionInterrupted && event.kind != relay::Event::Kind::ConnectionInvalid)
+      return;
+    std::function<void()> lost;
+    {
+      const std::lock_guard lock(watch->mutex);
+      lost = watch->lost;
+    }
+    if (lost) lost();
   };
 }
 
-}  // namespace
+void TNDaemonClient::setConnectionLostHandler(std::function<void()> lost) {
+  const std::lock_guard lock(watch_->mutex);
+  watch_->lost = std::move(lost);
+}
 
 TNDaemonClient::TNDaemonClient(std::optional<std::string> serviceName)
     : serviceName_(serviceName ? std::move(*serviceName) : std::string(kDefaultServiceName)),
@@ -52,7 +66,7 @@ TNDaemonClient::TNDaemonClient(std::optional<std::string> serviceName)
 }
 
 TNDaemonClient::~TNDaemonClient() {
-  releasing_->store(true);
+  watch_->releasing.store(true);
   if (auto connection = tenond()) connection->cancel();
 }
 
@@ -70,7 +84,7 @@ Result<std::shared_ptr<relay::Connection>> TNDaemonClient::connection() {
 Result<std::shared_ptr<relay::Connection>> TNDaemonClient::connectLocked() {
   Result<std::shared_ptr<relay::Connection>> connected = relay::Connection::connectToService(serviceName_, replyQueue_);
   if (!connected) return connected;
-  (*connected)->setEventHandler(eventHandler(releasing_));
+  (*connected)->setEventHandler(eventHandler(watch_));
   (*connected)->resume();
   tenond_ = *connected;
   return connected;

@@ -39,6 +39,7 @@
 #include <atomic>
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -77,6 +78,12 @@ class TNDaemonClient {
   explicit TNDaemonClient(std::optional<std::string> serviceName = std::nullopt);
   ~TNDaemonClient();
   TNDaemonClient(const TNDaemonClient&) = delete;
+
+  // Calls `lost` on the reply queue each time the connection breaks
+  // (interrupted or invalid), but not for the client's own release. What
+  // the daemon ties to a connection, holds above all, is gone then, even
+  // when the relay reconnects by itself.
+  void setConnectionLostHandler(std::function<void()> lost);
   TNDaemonClient& operator=(const TNDaemonClient&) = delete;
 
   // --- Properties ---
@@ -178,14 +185,22 @@ class TNDaemonClient {
   // The connection, connecting first when there is none yet. Any thread.
   Result<std::shared_ptr<relay::Connection>> connection();
   Result<std::shared_ptr<relay::Connection>> connectLocked();
+  struct ConnectionWatch;
+  static relay::Connection::EventHandler eventHandler(std::shared_ptr<ConnectionWatch> watch);
 
   const std::string serviceName_;
   const std::shared_ptr<dispatch::SerialQueue> replyQueue_;
   uint64_t protocolVersion_ = kCurrentProtocolVersion;
 
-  // Set when the client cancels its own connection, so that the event this
-  // causes is not reported as a communications error.
-  const std::shared_ptr<std::atomic<bool>> releasing_ = std::make_shared<std::atomic<bool>>(false);
+  // What the connection's event handler shares with the client: whether
+  // the client is cancelling its own connection (the event this causes is
+  // no communications error) and who to tell of a broken connection.
+  struct ConnectionWatch {
+    std::atomic<bool> releasing{false};  // the client's own cancel: stay quiet
+    std::mutex mutex;
+    std::function<void()> lost;  // guarded by mutex
+  };
+  const std::shared_ptr<ConnectionWatch> watch_ = std::make_shared<ConnectionWatch>();
 
   mutable std::mutex mutex_;
   std::shared_ptr<relay::Connection> tenond_;  // guarded by mutex_

@@ -113,6 +113,18 @@ TEST_F(TnctlHold, WaitKeepsTheHoldUntilSigtermAndThePlugInsAreRefusedMeanwhile) 
   EXPECT_EQ(readied.exitStatus, 0) << readied.err;
 }
 
+// A daemon that stops takes the hold with it: tnctl says so instead of
+// claiming to hold on.
+TEST_F(TnctlHold, WaitEndsWithStatusOneWhenTheDaemonGoes) {
+  auto holder = holdAndWait({application()});
+  ASSERT_TRUE(UUID::parse(firstLineOf(tokenFile_))) << daemon_.log();
+  EXPECT_EQ(daemon_.terminate(), 0);
+  const ProcessResult ended = holder->finish();
+  EXPECT_EQ(ended.exitStatus, 1) << ended.err;
+  EXPECT_NE(ended.err.find("tnctl: the connection to tenond broke; the hold ended with it\n"), std::string::npos)
+      << ended.err;
+}
+
 TEST_F(TnctlHold, ReleaseFromAnotherProcessEndsTheHold) {
   auto holder = holdAndWait({"--plugins", paths_.at(1)});
   const std::string token = firstLineOf(tokenFile_);

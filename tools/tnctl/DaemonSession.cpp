@@ -63,7 +63,7 @@ void runClientOperation(const GlobalOptions& options, const ClientOperation& ope
       printReply(client, *reply, options.json, /*succeeded=*/!error, handling.emptySuccess);
     }
     if (error) failWith(*error);
-    if (handling.whileConnected) handling.whileConnected();
+    if (handling.whileConnected) handling.whileConnected(client);
   });
 }
 

@@ -42,7 +42,7 @@ struct ReplyHandling {
   // Runs after a success has been printed and stdout flushed, before the
   // connection closes: what the daemon ties to the connection (a hold)
   // lasts until it returns.
-  std::function<void()> whileConnected;
+  std::function<void(tn::TNDaemonClient& client)> whileConnected;
 };
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation, const ReplyHandling& handling);
 

@@ -2,7 +2,8 @@
 //   puts plug-ins on hold ("lock", hold form) and prints the hold's token,
 //   alone on its line. A hold lasts as long as the connection that placed
 //   it: without --wait it ends when tnctl exits; with --wait tnctl keeps the
-//   connection (and the hold) until SIGINT, SIGTERM or SIGHUP, then exits 0.
+//   connection (and the hold) until SIGINT, SIGTERM or SIGHUP, then exits 0;
+//   if the daemon goes away meanwhile (and the hold with it), exits 1.
 //   A refusal for busy plug-ins prints "busy: <identifier>" per busy one.
 // tnctl release TOKEN
 //   ends the hold with that token ("lock", release form); prints "released".
@@ -54,12 +55,17 @@ struct HoldOptions {
 constexpr int kHoldEndingSignals[] = {SIGINT, SIGTERM, SIGHUP};
 int holdEndingPipe[2] = {-1, -1};
 
-void noteHoldEndingSignal(int) {
+// What ends the wait, as the byte written into the pipe.
+constexpr char kEndedBySignal = 's';
+constexpr char kEndedByLostConnection = 'c';
+
+void noteHoldEnding(char reason) {
   const int saved = errno;
-  const char byte = 0;
-  [[maybe_unused]] const ssize_t written = ::write(holdEndingPipe[1], &byte, 1);
+  [[maybe_unused]] const ssize_t written = ::write(holdEndingPipe[1], &reason, 1);
   errno = saved;
 }
+
+void noteHoldEndingSignal(int) { noteHoldEnding(kEndedBySignal); }
 
 // Installed before the request goes out, so that a signal sent as soon as
 // the token is out ends the hold cleanly rather than killing tnctl.
@@ -74,11 +80,15 @@ void catchHoldEndingSignals() {
   for (const int signal : kHoldEndingSignals) ::sigaction(signal, &action, nullptr);
 }
 
-void awaitHoldEndingSignal() {
+// Waits for a signal; a connection that breaks meanwhile (the daemon
+// stopped or restarted) has ended the hold, which fails the command.
+void awaitHoldEndingSignal(tn::TNDaemonClient& client) {
+  client.setConnectionLostHandler([] { noteHoldEnding(kEndedByLostConnection); });
   std::fprintf(stderr, "tnctl: holding until SIGINT or SIGTERM\n");
   char byte = 0;
   while (::read(holdEndingPipe[0], &byte, 1) < 0 && errno == EINTR) {
   }
+  if (byte == kEndedByLostConnection) fail("the connection to tenond broke; the hold ended with it");
 }
 
 // A refusal for busy plug-ins names each busy one by its identifier.
@@ -107,7 +117,8 @@ void addHoldCommand(CLI::App& app, const GlobalOptions& options) {
   command->add_flag("--terminate", arguments->terminate,
                     "Terminate the plug-ins' running instances before the hold is reported");
   command->add_flag("--wait", arguments->wait,
-                    "After printing the token, keep the hold until SIGINT or SIGTERM, then exit 0");
+                    "After printing the token, keep the hold until SIGINT or SIGTERM, then exit 0 (1 if tenond "
+                    "stops meanwhile: the hold ends with it)");
   command->callback([&options, arguments] {
     const std::vector<std::string> paths = absolutePaths(arguments->paths);
     if (arguments->wait) catchHoldEndingSignals();

@@ -5,8 +5,9 @@ every command and option tnctl's help lists is described in tnctl(1), every
 option tenond's usage line shows is in tenond(8).
 
 Run by CTest with:
-  TENON_MAN_DIR  docs/man
-  TNCTL, TENOND  the built programs
+  TENON_MAN_DIR     docs/man
+  TENON_SOURCE_DIR  the source tree (for the keys the code reads)
+  TNCTL, TENOND     the built programs
 """
 
 import os
@@ -138,6 +139,34 @@ class TnctlPageTest(unittest.TestCase):
         documented = set(re.findall(r"^\\fBtnctl ((?:[a-z]|\\-)+(?: [a-z]+)?)\\fP", self.page, re.MULTILINE))
         documented = {name.replace("\\-", "-") for name in documented}
         self.assertEqual(documented, {" ".join(command) for command in self.commands()})
+
+
+class BundlePageTest(unittest.TestCase):
+    """tenon-bundle(5) describes every key of Info.manifest and of the
+    plug-in dictionary that the plug-in model names, and the keys the
+    daemon's own record reads."""
+
+    KEY_FILES = {
+        "libtenon/model/PlugInKeys.h": ("// Bundle information dictionary", "// Values."),
+        "tenond/plugin/TNDPlugIn.h": ("", None),
+    }
+    NOT_MANIFEST_KEYS = {"_SandboxProfile", "_OmitSandboxParameters", "BNBundlePackageType", "RLY!"}
+
+    def keys_in(self, relative, first, last):
+        with open(os.path.join(os.environ["TENON_SOURCE_DIR"], relative), encoding="utf-8") as file:
+            text = file.read()
+        text = text[text.index(first):text.index(last) if last else len(text)]
+        return set(re.findall(r'k\w+Key\w*\s*=\s*"([A-Za-z]+)"|k\w+\s*=\s*"([A-Z][A-Za-z]+)"', text))
+
+    def test_every_key_the_code_names_is_described(self):
+        page = read_page("tenon-bundle.5")
+        described = set(re.findall(r"^\.BR? (\S+)", page, re.MULTILINE))
+        keys = set()
+        for relative, (first, last) in self.KEY_FILES.items():
+            keys |= {a or b for a, b in self.keys_in(relative, first, last)}
+        keys -= self.NOT_MANIFEST_KEYS
+        self.assertGreater(len(keys), 20)
+        self.assertEqual(sorted(keys - described), [])
 
 
 class TenondPageTest(unittest.TestCase):

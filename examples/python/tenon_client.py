@@ -28,7 +28,13 @@ import struct
 import sys
 import uuid
 
-import cbor2
+try:
+    import cbor2
+except ImportError:  # reported when the client is used, with what to install
+    cbor2 = None
+
+CBOR2_MISSING = ("the Python module cbor2 is not installed: install the package python3-cbor2 "
+                 "(Debian: apt-get install python3-cbor2) or run: pip install cbor2")
 
 DEFAULT_SERVICE = "com.ostrel.tenon.tenond"
 
@@ -48,6 +54,21 @@ class ProtocolError(Exception):
     """The daemon sent something this client cannot accept."""
 
 
+class MissingCbor2(ImportError):
+    """cbor2, the one module this client needs beyond Python's own, is not
+    installed. Raised when the client is first used rather than on import,
+    so that the command-line tool can say what to install."""
+
+    def __init__(self):
+        super().__init__(f"tenon_client needs cbor2; {CBOR2_MISSING}", name="cbor2")
+
+
+def require_cbor2():
+    """Raises MissingCbor2 unless cbor2 can be used."""
+    if cbor2 is None:
+        raise MissingCbor2()
+
+
 def service_path(service):
     """The socket of a relay service: $TENON_ROOT/run/tenon/relay/<service>."""
     if not service or service in (".", "..") or "/" in service or "\0" in service:
@@ -60,6 +81,7 @@ def encode_body(body):
     tag 1 (cbor2 does both); keys must be strings."""
     if not isinstance(body, dict) or not all(isinstance(key, str) for key in body):
         raise TypeError("a request is a dictionary with string keys")
+    require_cbor2()
     return cbor2.dumps(body, datetime_as_timestamp=True, timezone=datetime.timezone.utc)
 
 
@@ -71,6 +93,7 @@ def decode_body(payload):
     """A frame body: one CBOR map. cbor2 turns tag 37 into uuid.UUID and
     tag 1 into an aware datetime; tags it does not interpret itself are
     refused (tenond sends no others)."""
+    require_cbor2()
     body = cbor2.loads(payload, tag_hook=_refuse_unknown_tag)
     if not isinstance(body, dict):
         raise ProtocolError("message body must be a map")
@@ -90,6 +113,7 @@ def decode_typed(data):
     """The value in a typed encoding (the byte string under "matches")."""
     if not isinstance(data, (bytes, bytearray)):
         raise ProtocolError("typed encoding must be a data value")
+    require_cbor2()
     return cbor2.loads(bytes(data), tag_hook=_typed_integer)
 
 
@@ -98,6 +122,7 @@ class Client:
     time, each answered before the next is sent."""
 
     def __init__(self, service=DEFAULT_SERVICE, timeout=30.0):
+        require_cbor2()
         self.service = service
         self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
         self._socket.settimeout(timeout)
@@ -211,6 +236,9 @@ def main(argv=None):
     parser.add_argument("--service", default=DEFAULT_SERVICE, help="relay service name of tenond")
     parser.add_argument("--timeout", type=float, default=30.0, help="seconds to wait for the reply")
     arguments = parser.parse_args(argv)
+    if cbor2 is None:
+        print(f"tenon_client: {CBOR2_MISSING}", file=sys.stderr)
+        return 1
 
     try:
         body = json.loads(arguments.request)

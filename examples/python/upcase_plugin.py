@@ -27,7 +27,10 @@ def answer(instance, line):
 
 
 def main():
-    instance = tenon_client.PlugInInstance()
+    try:
+        instance = tenon_client.PlugInInstance()
+    except tenon_client.MissingCbor2 as missing:
+        sys.exit(f"upcase_plugin: {missing}")
     host = instance.host_socket()
     if host is None:
         sys.exit("upcase_plugin: TENON_PLUGIN_SOCKET names no socket; the supervisor starts this program")

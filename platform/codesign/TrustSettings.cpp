@@ -1,5 +1,7 @@
 #include "platform/codesign/TrustSettings.h"
 
+#include "platform/paths/InstancePaths.h"
+
 #include <unistd.h>
 
 #include <cstdlib>
@@ -7,9 +9,8 @@
 namespace codesign {
 
 TrustSettings TrustSettings::fromEnvironment() {
-  const char* root = std::getenv("TENON_ROOT");
   TrustSettings settings;
-  settings.entitlementsDirectory = std::string(root != nullptr ? root : "") + "/etc/tenon/entitlements.d";
+  settings.entitlementsDirectory = paths::platformRoot() + "/etc/tenon/entitlements.d";
   settings.daemonUser = ::geteuid();
   return settings;
 }

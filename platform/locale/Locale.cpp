@@ -7,6 +7,7 @@
 #include <mutex>
 
 #include "platform/log/Log.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace locale {
 namespace {
@@ -15,8 +16,7 @@ constexpr const char* kLocaleKeys[] = {"LC_ALL", "LC_MESSAGES", "LANG"};
 constexpr const char* kConfigurationName = "locale.conf";
 
 std::string platformRoot() {
-  const char* root = std::getenv("TENON_ROOT");
-  return root ? root : "";
+  return paths::platformRoot();
 }
 
 std::string_view trimmed(std::string_view text) {

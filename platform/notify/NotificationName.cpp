@@ -1,5 +1,7 @@
 #include "platform/notify/NotificationName.h"
 
+#include "platform/paths/InstancePaths.h"
+
 #include <sys/stat.h>
 
 #include <cerrno>
@@ -50,8 +52,7 @@ tn::Result<void> validateNotificationName(std::string_view name) {
 }
 
 std::string notificationDirectory() {
-  const char* root = std::getenv("TENON_ROOT");
-  return std::string(root != nullptr ? root : "") + "/run/tenon/notify";
+  return paths::currentLayout().notificationDirectory;
 }
 
 std::string notificationPath(std::string_view name) { return notificationDirectory() + "/" + std::string(name); }

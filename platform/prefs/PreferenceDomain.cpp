@@ -17,17 +17,13 @@
 
 #include "platform/value/AtomicFile.h"
 #include "platform/value/Document.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace prefs {
 namespace {
 
 tn::Error preferencesError(PreferencesErrorCode code, std::string message) {
   return tn::Error(std::string(kPreferencesErrorDomain), static_cast<int64_t>(code), std::move(message));
-}
-
-std::string platformRoot() {
-  const char* root = std::getenv("TENON_ROOT");
-  return root ? root : "";
 }
 
 // Holds an exclusive flock on a lock file for its lifetime.
@@ -73,7 +69,7 @@ PreferenceDomain::PreferenceDomain(std::string name, uid_t uid) : name_(std::mov
 PreferenceDomain::PreferenceDomain(std::string name) : PreferenceDomain(std::move(name), ::getuid()) {}
 
 std::string PreferenceDomain::path() const {
-  return fmt::format("{}/var/lib/tenon/prefs/{}/{}.manifest", platformRoot(), uid_, name_);
+  return fmt::format("{}/{}/{}.manifest", paths::currentLayout().preferencesDirectory, uid_, name_);
 }
 
 tn::Result<void> PreferenceDomain::checkName() const {

@@ -18,6 +18,7 @@
 #include "platform/log/Log.h"
 #include "platform/value/AtomicFile.h"
 #include "platform/value/Document.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace privy {
 namespace {
@@ -112,8 +113,7 @@ bool isConsentIdentifier(std::string_view identifier) {
 }
 
 std::string consentStorePath() {
-  const char* root = std::getenv("TENON_ROOT");
-  return std::string(root ? root : "") + "/var/lib/tenon/consent.manifest";
+  return paths::currentLayout().consentStore;
 }
 
 ConsentStore::ConsentStore(std::string path, uid_t trustedUser) : path_(std::move(path)), trustedUser_(trustedUser) {}

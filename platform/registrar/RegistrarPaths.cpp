@@ -3,6 +3,7 @@
 #include <cstdlib>
 
 #include "platform/bundle/BundlePaths.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace registrar {
 namespace {
@@ -44,7 +45,15 @@ RegistrarPaths RegistrarPaths::forRoot(const std::string& root, const std::strin
 }
 
 RegistrarPaths RegistrarPaths::fromEnvironment() {
-  return forRoot(environment("TENON_ROOT"), environment("TENON_APP_DIRS"));
+  // A per-user instance keeps its own store and containers; what it scans
+  // and reads is the system's.
+  const paths::Layout layout = paths::currentLayout();
+  RegistrarPaths found = forRoot(layout.root, environment("TENON_APP_DIRS"));
+  if (layout.instance == paths::Instance::User) {
+    found.storeFile = layout.registrarStore;
+    found.containersDirectory = layout.containersDirectory;
+  }
+  return found;
 }
 
 bool RegistrarPaths::onSystemPartition(const std::string& path) const {

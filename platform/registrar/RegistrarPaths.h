@@ -1,6 +1,7 @@
 #pragma once
 
-// Where the registrar finds and keeps things, all under $TENON_ROOT
+// Where the registrar finds and keeps things, all under $TENON_ROOT but, for
+// a per-user instance, its store and containers (platform/paths)
 // (ARCHITECTURE.md section 8).
 
 #include <string>
@@ -23,7 +24,8 @@ struct RegistrarPaths {
   // of TENON_APP_DIRS: absolute paths separated by ':') names others.
   static RegistrarPaths forRoot(const std::string& root, const std::string& applicationDirectories = "");
 
-  // forRoot($TENON_ROOT, $TENON_APP_DIRS), read when called.
+  // forRoot($TENON_ROOT, $TENON_APP_DIRS), read when called; a per-user
+  // instance's store and containers are its own (InstancePaths.h).
   static RegistrarPaths fromEnvironment();
 
   // True when path lies under the system volume.

@@ -315,4 +315,6 @@ const std::string& Listener::socketPath() const { return core_->path; }
 
 bool Listener::isSocketActivated() const { return core_->activated; }
 
+std::size_t Listener::connectionCount() const { return core_->limit->total(); }
+
 }  // namespace relay

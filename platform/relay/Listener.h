@@ -96,6 +96,8 @@ class Listener {
   // The socket's path; for an activated socket, the path it would have had.
   const std::string& socketPath() const;
   bool isSocketActivated() const;
+  // Connections admitted and not yet ended (their places under the limits).
+  std::size_t connectionCount() const;
 
 
  private:

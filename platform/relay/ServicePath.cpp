@@ -9,11 +9,10 @@
 #include <fmt/format.h>
 
 #include "platform/relay/RelayError.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace relay {
 namespace {
-
-constexpr std::string_view kRelaySubdirectory = "/run/tenon/relay";
 
 tn::Error invalidName(std::string_view serviceName, std::string_view why) {
   return makeRelayError(RelayErrorCode::InvalidServiceName,
@@ -46,10 +45,7 @@ tn::Result<void> validateServiceName(std::string_view serviceName) {
   return {};
 }
 
-std::string relayDirectory() {
-  const char* root = std::getenv("TENON_ROOT");
-  return fmt::format("{}{}", root != nullptr ? root : "", kRelaySubdirectory);
-}
+std::string relayDirectory() { return paths::currentLayout().relayDirectory; }
 
 tn::Result<std::string> servicePath(std::string_view serviceName) {
   if (tn::Result<void> valid = validateServiceName(serviceName); !valid.ok()) return valid.error();

@@ -14,6 +14,7 @@
 #include <openssl/rand.h>
 
 #include "platform/value/AtomicFile.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace sandbox {
 namespace {
@@ -103,8 +104,7 @@ tn::Result<void> createKeyFile(const std::string& path) {
 }  // namespace
 
 std::string sandboxKeyPath() {
-  const char* root = std::getenv("TENON_ROOT");
-  return std::string(root != nullptr ? root : "") + "/var/lib/tenon/sandbox.key";
+  return paths::currentLayout().sandboxKeyFile;
 }
 
 tn::Result<SandboxKey> readSandboxKey() { return readKeyFile(sandboxKeyPath()); }

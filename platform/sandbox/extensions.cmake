@@ -4,4 +4,4 @@ target_sources(tn_sandbox PRIVATE
   ${CMAKE_CURRENT_LIST_DIR}/SandboxKey.cpp
   ${CMAKE_CURRENT_LIST_DIR}/ExtensionToken.cpp
   ${CMAKE_CURRENT_LIST_DIR}/Extensions.cpp)
-target_link_libraries(tn_sandbox PUBLIC tn_value PRIVATE OpenSSL::Crypto fmt::fmt)
+target_link_libraries(tn_sandbox PUBLIC tn_value PRIVATE tn_paths OpenSSL::Crypto fmt::fmt)

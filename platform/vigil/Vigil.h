@@ -64,6 +64,9 @@ class Vigil : public std::enable_shared_from_this<Vigil> {
   Vigil(const Vigil&) = delete;
   Vigil& operator=(const Vigil&) = delete;
 
+  // Its clients' connections that have not ended.
+  std::size_t connectionCount() const { return listener_->connectionCount(); }
+
   // The busy instances whose bundle identifier is in `bundleIdentifiers`,
   // each {"BNBundleIdentifier": ..., "BNBundleVersion": ..., "pid": N}, in
   // the order they became busy.

@@ -10,6 +10,7 @@
 #include "platform/value/Document.h"
 #include "platform/warden/SeccompProgram.h"
 #include "platform/warden/WardenError.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace warden {
 namespace {
@@ -65,8 +66,7 @@ bool isProfileName(std::string_view name) {
 }
 
 std::string SandboxProfile::directory() {
-  const char* root = std::getenv("TENON_ROOT");
-  return std::string(root != nullptr ? root : "") + "/usr/share/tenon/sandbox-profiles";
+  return paths::platformRoot() + "/usr/share/tenon/sandbox-profiles";
 }
 
 std::string SandboxProfile::pathOf(std::string_view name) { return fmt::format("{}/{}.manifest", directory(), name); }

@@ -4,6 +4,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 
@@ -16,6 +17,7 @@
 #include "platform/warden/Spawner.h"
 #include "platform/warden/Warden.h"
 #include "platform/warden/WardenError.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace warden {
 namespace {
@@ -23,22 +25,26 @@ namespace {
 // $TENON_ROOT/var/lib/tenon/containers/<identifier>: the plug-in's data
 // container, derived here from the identifier the supervisor read itself.
 std::string containerPath(const std::string& bundleIdentifier) {
-  const char* root = std::getenv("TENON_ROOT");
-  return fmt::format("{}/var/lib/tenon/containers/{}", root != nullptr ? root : "", bundleIdentifier);
+  return fmt::format("{}/{}", paths::currentLayout().containersDirectory, bundleIdentifier);
 }
 
 // The plug-in's environment: the overlay's, then what the supervisor sets
-// itself (its socket's descriptor; the platform root it was started in, so
-// the plug-in reaches this root's services).
+// itself (its socket's descriptor; the platform root and instance it was
+// started in, so the plug-in reaches this instance's services).
 std::vector<std::string> environmentFor(const Registration& registration) {
+  const std::vector<std::string> instance = paths::instanceEnvironment();
+  const auto ours = [&instance](const std::string& name) {
+    if (name == kPluginSocketVariable || name == "TENON_ROOT") return true;
+    return std::any_of(instance.begin(), instance.end(), [&name](const std::string& entry) {
+      return entry.size() > name.size() && entry.starts_with(name) && entry[name.size()] == '=';
+    });
+  };
   std::vector<std::string> environment;
-  const auto ours = [](const std::string& name) { return name == kPluginSocketVariable || name == "TENON_ROOT"; };
   for (const auto& [name, value] : registration.overlay.environment) {
     if (!ours(name)) environment.push_back(name + "=" + value);
   }
   environment.push_back(fmt::format("{}={}", kPluginSocketVariable, kPluginSocketDescriptor));
-  const char* root = std::getenv("TENON_ROOT");
-  if (root != nullptr && *root != '\0') environment.push_back(fmt::format("TENON_ROOT={}", root));
+  environment.insert(environment.end(), instance.begin(), instance.end());
   return environment;
 }
 

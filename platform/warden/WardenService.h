@@ -51,6 +51,9 @@ class WardenService {
                                                            const std::string& serviceName = kWardenServiceName);
   ~WardenService();
 
+  // Its clients' connections that have not ended.
+  std::size_t connectionCount() const { return listener_->connectionCount(); }
+
   // The reply to one request of `peer` (without the descriptor a start
   // hands over, which goes to `hostSocket`).
   static tn::Value answer(Warden& warden, const PrivilegeTest& isPrivileged, const relay::PeerIdentity& peer,

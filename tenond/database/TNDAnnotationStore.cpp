@@ -12,6 +12,7 @@
 #include "platform/log/Probes.h"
 #include "platform/value/AtomicFile.h"
 #include "platform/value/Document.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace tnd {
 namespace {
@@ -78,8 +79,7 @@ std::optional<tn::Error> refused(const std::string& key, const std::string& reas
 }  // namespace
 
 std::string TNDAnnotationStore::defaultDatabasePath() {
-  const char* root = std::getenv("TENON_ROOT");
-  return std::string(root ? root : "") + "/var/db/Tenon-Annotations";
+  return paths::currentLayout().annotationFile;
 }
 
 TNDAnnotationStore::TNDAnnotationStore(const std::optional<std::string>& path)

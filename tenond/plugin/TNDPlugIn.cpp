@@ -8,6 +8,7 @@
 #include "libtenon/model/TNSandboxExtension.h"
 #include "platform/value/Date.h"
 #include "platform/log/Log.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace tnd {
 namespace {
@@ -30,8 +31,7 @@ std::string failureText(const tn::Error& error) {
 }  // namespace
 
 std::string TNDPlugIn::systemVolumePrefix() {
-  const char* root = std::getenv("TENON_ROOT");
-  return std::string(root ? root : "") + "/System/";
+  return paths::platformRoot() + "/System/";
 }
 
 TNDPlugIn::TNDPlugIn(CreateTag, std::shared_ptr<const registrar::Registrar> registrar)

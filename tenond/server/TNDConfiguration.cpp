@@ -15,6 +15,7 @@
 #include "platform/bundle/ManifestFile.h"
 #include "platform/codesign/TrustRule.h"
 #include "platform/log/Log.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace tnd {
 namespace {
@@ -24,6 +25,8 @@ constexpr std::string_view kConnectionsPerUser = "connections-per-user";
 constexpr std::string_view kConnectionsTotal = "connections-total";
 constexpr std::string_view kTerminationGrace = "termination-grace-seconds";
 constexpr std::size_t kLongestTerminationGrace = 3600;
+constexpr std::string_view kIdleExit = "idle-exit-seconds";
+constexpr std::size_t kLongestIdleExit = 86400;
 
 void logBadKey(const std::string& path, std::string_view key, std::string_view reason) {
   TN_LOG_ERROR(tn::log::ops(), "configuration {}: \"{}\" {}; using its default", path, key, reason);
@@ -85,11 +88,20 @@ std::optional<std::size_t> positiveCount(const tn::Value& value, std::string_vie
   return static_cast<std::size_t>(*number);
 }
 
+// 0 (never) or a number of seconds up to kLongestIdleExit.
+std::optional<std::size_t> readIdleExitSeconds(const tn::Value& value, const std::string& path) {
+  const std::optional<uint64_t> number = value.uint64();
+  if (!number || *number > kLongestIdleExit) {
+    logBadKey(path, kIdleExit, fmt::format("is not an integer from 0 to {}", kLongestIdleExit));
+    return std::nullopt;
+  }
+  return static_cast<std::size_t>(*number);
+}
+
 }  // namespace
 
 std::string TNDConfiguration::path() {
-  const char* root = std::getenv("TENON_ROOT");
-  return std::string(root != nullptr ? root : "") + "/etc/tenon/tenond.manifest";
+  return paths::currentLayout().configurationFile;
 }
 
 TNDConfiguration TNDConfiguration::fromDocument(const tn::Value& document, const std::string& path) {
@@ -112,6 +124,8 @@ TNDConfiguration TNDConfiguration::fromDocument(const tn::Value& document, const
         logBadKey(path, key, fmt::format("is more than {}", kLongestTerminationGrace));
         configuration.terminationGraceSeconds.reset();
       }
+    } else if (key == kIdleExit) {
+      configuration.idleExitSeconds = readIdleExitSeconds(value, path);
     } else {
       TN_LOG_ERROR(tn::log::ops(), "configuration {}: unknown key \"{}\" ignored", path, key);
     }

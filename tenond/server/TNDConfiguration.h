@@ -1,12 +1,13 @@
 #pragma once
 
 // TNDConfiguration: the daemon's settings, from the administrator's document
-// $TENON_ROOT/etc/tenon/tenond.manifest (TENON_ROOT empty or unset: /etc/...),
+// $TENON_ROOT/etc/tenon/tenond.manifest (TENON_ROOT empty or unset: /etc/...;
+// a per-user instance: $XDG_CONFIG_HOME/tenon/tenond.manifest, InstancePaths.h),
 // a structured-value document (XML or JSON) holding a dictionary:
 //
 //   {"privileged-groups": ["tenon-admin", 1001],
 //    "connections-per-user": 64, "connections-total": 4096,
-//    "termination-grace-seconds": 2}
+//    "termination-grace-seconds": 2, "idle-exit-seconds": 120}
 //
 // docs/configuration.md describes the keys for administrators. The document
 // is read once, when the server is made, and only when it passes the trust
@@ -42,6 +43,13 @@ struct TNDConfiguration {
   // "termination-grace-seconds": how long a plug-in instance told to stop
   // (SIGTERM) may take before it is killed; 1 to 3600.
   std::optional<std::size_t> terminationGraceSeconds;
+  // "idle-exit-seconds": how long a socket-activated daemon with no
+  // connection, no hold and no running plug-in instance waits before it
+  // exits (the service manager starts it again for the next client); 0
+  // never, at most 86400. Default kDefaultIdleExitSeconds. A daemon that
+  // bound its own socket never exits for idleness.
+  static constexpr std::size_t kDefaultIdleExitSeconds = 120;
+  std::optional<std::size_t> idleExitSeconds;
 
   // The configuration of $TENON_ROOT/etc/tenon/tenond.manifest (see above).
   static TNDConfiguration load();

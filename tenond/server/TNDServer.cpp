@@ -6,6 +6,7 @@
 #include "platform/dispatch/MainLoop.h"
 #include "platform/log/Log.h"
 #include "platform/notify/Notify.h"
+#include "platform/relay/KeepAlive.h"
 #include "platform/relay/RelayError.h"
 #include "platform/types/TypeHierarchy.h"
 #include "tenond/QueueRanks.h"
@@ -136,6 +137,15 @@ void TNDServer::stop() {
   });
   postAnnotationChanges(1);  // one, even with no holds
 }
+
+bool TNDServer::isIdle() const {
+  if (service_->connectionCount() != 0 || relay::keepAliveCount() != 0) return false;
+  if (wardenService_ && wardenService_->connectionCount() != 0) return false;
+  if (vigil_ && vigil_->connectionCount() != 0) return false;
+  return warden_->registrationCount() == 0 && warden_->instanceCount() == 0;
+}
+
+void TNDServer::stopAccepting() { service_->cancel(); }
 
 bool TNDServer::holdOnPlugIn(const tn::UUID& plugIn, uid_t user) {
   return syncQueue_->sync([&] {

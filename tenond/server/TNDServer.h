@@ -68,6 +68,15 @@ class TNDServer final : public TNDatabase,
   // queue (the SIGTERM handler).
   void stop();
 
+  // True while no client is connected to any of the daemon's services, no
+  // hold or other transaction is open (relay::keepAliveCount) and the
+  // supervisor has no registration and no running instance: the daemon
+  // could go without anyone losing anything. Threads: any.
+  bool isIdle() const;
+  // Stops accepting clients on every listener; clients already connected
+  // are served on. Runs on the main queue (IdleExit).
+  void stopAccepting();
+
   // Holds. All of them enter "serverSync" synchronously; those that change
   // the list post one annotation-change notification per hold added or
   // released, after leaving "serverSync". A hold blocks a plug-in for the

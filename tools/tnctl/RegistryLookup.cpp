@@ -8,6 +8,7 @@
 #include "platform/bundle/BundlePaths.h"
 #include "platform/bundle/ManifestFile.h"
 #include "platform/locale/Locale.h"
+#include "platform/paths/InstancePaths.h"
 
 namespace tnctl {
 namespace {
@@ -17,8 +18,7 @@ constexpr std::string_view kManifestSuffix = ".manifest";
 constexpr std::string_view kBaseLanguage = "Base";  // ends every fallback, as in the registrar
 
 std::string platformRoot() {
-  const char* root = std::getenv("TENON_ROOT");
-  return root != nullptr ? root : "";
+  return paths::platformRoot();
 }
 
 // The languages to try, most preferred first: the current locale's

@@ -47,9 +47,7 @@ void list(const GlobalOptions& options, const std::string& only) {
     if (only.empty() || application == only) shown.set(application, describe(entries));
   }
   if (options.json) {
-    tn::Result<std::string> text = tn::writeJsonDocument(tn::Value(shown));
-    if (!text.ok()) fail(text.error().localizedDescription());
-    fmt::print("{}", *text);
+    printJsonDocument(tn::Value(shown));
     return;
   }
   for (const auto& [application, entries] : *records) {

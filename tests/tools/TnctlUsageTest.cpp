@@ -91,6 +91,15 @@ TEST(TnctlUnreachable, AMissingDaemonIsNamedByItsSocketWithTheLikelyCauses) {
   EXPECT_NE(outcome["error"].string()->find("is tenond running"), std::string::npos);
 }
 
+TEST(TnctlJson, DocumentWritesJsonUnlessToSaysOtherwise) {
+  const std::string file = TENON_SOURCE_DIR "/examples/documents/annotations.xml";
+  const test::ProcessResult json = tnctl({"--json", "document", file});
+  EXPECT_EQ(json.exitStatus, 0) << json.err;
+  EXPECT_TRUE(readDocument(json.out, "stdout", DocumentEncoding::Json)) << json.out;
+  const test::ProcessResult xml = tnctl({"--json", "document", file, "--to", "xml"});
+  EXPECT_EQ(xml.out.rfind("<?xml", 0), 0u) << xml.out;
+}
+
 TEST(TnctlJson, FailuresOfLocalCommandsAreOneDocument) {
   const test::ProcessResult result = tnctl({"--json", "document", "/nonexistent/file.xml"});
   EXPECT_EQ(result.exitStatus, 1);

@@ -29,6 +29,8 @@ struct ConsentArguments {
 void change(const ConsentArguments& arguments, bool granted) {
   const tn::Result<void> changed = privy::ConsentStore().setConsent(arguments.application, arguments.service, granted);
   if (!changed.ok()) fail(changed.error().localizedDescription());
+  // Silent for people, as a changed setting is; a document for scripts.
+  if (jsonOutcome()) printJsonDocument(tn::Dictionary{{"ok", true}});
 }
 
 tn::Value describe(const std::vector<privy::ConsentRecord>& records) {

@@ -93,10 +93,13 @@ TEST_F(Registration, AddRegistersInOrderAndStopsAtTheFirstBadPath) {
   EXPECT_EQ(tnctl({"add", daemon_.root() + "/links/Dangling.bundle"}).err,
             "tnctl: error 9: invalid plugin path: " + daemon_.root() + "/links/Dangling.bundle\n");
 
-  // A directory that is no bundle is refused by the registrar.
-  std::filesystem::create_directories(daemon_.root() + "/empty.bundle");
-  const auto refused = tnctl({"add", daemon_.root() + "/empty.bundle"});
-  EXPECT_EQ(refused.err, "tnctl: error 2: unable to register plug-in at " + daemon_.root() + "/empty.bundle\n");
+  // A directory that is no bundle is refused by the registrar; tnctl says
+  // why, as its lint finds it.
+  const std::string empty = daemon_.root() + "/empty.bundle";
+  std::filesystem::create_directories(empty);
+  const auto refused = tnctl({"add", empty});
+  EXPECT_EQ(refused.err, "tnctl: error 2: unable to register plug-in at " + empty + "\ntnctl: " + empty + ": " +
+                             empty + "/Info.manifest: cannot read: No such file or directory\n");
   EXPECT_NE(daemon_.log().find("failed to register plug-in at " + daemon_.root() + "/empty.bundle"),
             std::string::npos);
 }

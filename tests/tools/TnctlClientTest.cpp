@@ -16,6 +16,7 @@
 #include "platform/value/Document.h"
 #include "platform/value/TypedEncoding.h"
 #include "tests/libtenon/client/FakeDaemon.h"
+#include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
 #include "tests/support/Subprocess.h"
 
@@ -56,9 +57,11 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
   EXPECT_EQ(version.exitStatus, 1);
   EXPECT_EQ(version.err, "tnctl: error 7: unsupported protocol version 1 (current 3)\n");
 
-  // A raw request goes out as given: without a version it is version 0.
+  // A raw request goes out as given: without a version it is version 0,
+  // and tnctl says that the key is missing.
   const auto unversioned = tnctl({"request", R"({"request":"match"})"});
-  EXPECT_EQ(unversioned.err, "tnctl: error 7: unsupported protocol version 0 (current 3)\n");
+  EXPECT_EQ(unversioned.err, "tnctl: error 7: unsupported protocol version 0 (current 3)\n"
+                             "tnctl: the request has no \"version\" key (the current protocol version is 3)\n");
 
   const auto untyped = tnctl({"request", R"({"version":3})"});
   EXPECT_EQ(untyped.err, "tnctl: error 4: invalid request format (missing type)\n");
@@ -85,6 +88,19 @@ TEST_F(TnctlClient, TheDaemonsEnvelopeErrorsReachTheUserAsOneLineAndStatusOne) {
   EXPECT_EQ(daemon_.terminate(), 0) << daemon_.log();
 }
 
+TEST_F(TnctlClient, AddOfABundleTheRegistrarRefusesSaysWhy) {
+  const std::string bundle = daemon_.root() + "/plugins/Flat.tnx";
+  test::makeBundle(bundle, R"({"BNBundleIdentifier": "com.example.flat", "XTExtension": "com.example.share"})");
+  const auto added = tnctl({"add", bundle});
+  EXPECT_EQ(added.exitStatus, 1);
+  EXPECT_EQ(added.out, "");
+  EXPECT_NE(added.err.find("tnctl: error 2: unable to register plug-in at "), std::string::npos) << added.err;
+  EXPECT_NE(added.err.find("\ntnctl: " + bundle + ": \"XTExtension\" in Info.manifest has the wrong type: a "
+                           "string where a dictionary is needed\n"),
+            std::string::npos)
+      << added.err;
+}
+
 TEST_F(TnctlClient, JsonOutputIsTheReplyAsADocument) {
   const auto result = tnctl({"--json", "find", "--uuid", "E621E1F8-C36C-495A-93FC-0C247A3E6E5F"});
   EXPECT_EQ(result.exitStatus, 1);
@@ -109,6 +125,10 @@ TEST_F(TnctlClient, BadArgumentsAreRefusedBeforeAnythingIsSent) {
   EXPECT_EQ(rules.err, "tnctl: --rules must be a dictionary\n");
 
   EXPECT_NE(tnctl({"find"}).exitStatus, 0) << "find needs --uuid or --url";
+
+  const auto unknown = tnctl({"match", "--rulez", "{}"});
+  EXPECT_EQ(unknown.exitStatus, 2);
+  EXPECT_EQ(unknown.err.rfind("tnctl: unknown option \"--rulez\" for tnctl match", 0), 0u) << unknown.err;
 }
 
 TEST(TnctlUnreachable, AMissingDaemonGivesOneClearLine) {
@@ -116,7 +136,10 @@ TEST(TnctlUnreachable, AMissingDaemonGivesOneClearLine) {
                                        {"TENON_ROOT=/nonexistent-tenon-root"});
   EXPECT_EQ(result.exitStatus, 1);
   EXPECT_EQ(result.out, "");
-  EXPECT_EQ(result.err.rfind("tnctl: cannot reach tenond at com.ostrel.tenon.test.nobody: ", 0), 0u) << result.err;
+  // Named by its socket (TnctlUsageTest has the likely causes).
+  EXPECT_EQ(result.err.rfind("tnctl: cannot reach tenond at "
+                             "/nonexistent-tenon-root/run/tenon/relay/com.ostrel.tenon.test.nobody: ", 0), 0u)
+      << result.err;
   EXPECT_EQ(lineCount(result.err), 1u) << result.err;
 }
 

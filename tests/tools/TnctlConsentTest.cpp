@@ -41,6 +41,18 @@ TEST(TnctlConsent, GrantRevokeAndListWithJson) {
   const auto bad = run({"grant", "com.example.photos", "no spaces"});
   EXPECT_EQ(bad.exitStatus, 1);
   EXPECT_EQ(bad.err, "tnctl: application and service identifiers are 1 to 255 letters, digits and -._\n");
+
+  // For scripts a change and a refusal are each one document.
+  const auto changed = run({"--json", "grant", "com.example.notes", "com.ostrel.privy.camera"});
+  EXPECT_EQ(changed.exitStatus, 0) << changed.err;
+  const Result<Value> changedDocument = readDocument(changed.out, "stdout");
+  ASSERT_TRUE(changedDocument.ok()) << changed.out;
+  EXPECT_EQ((*changedDocument)["ok"], Value(true));
+  const auto refused = run({"--json", "grant", "com.example.photos", "no spaces"});
+  EXPECT_EQ(refused.exitStatus, 1);
+  const Result<Value> refusedDocument = readDocument(refused.out, "stdout");
+  ASSERT_TRUE(refusedDocument.ok()) << refused.out;
+  EXPECT_EQ((*refusedDocument)["ok"], Value(false));
 }
 
 }  // namespace

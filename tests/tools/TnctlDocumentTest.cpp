@@ -75,8 +75,9 @@ TEST_F(TnctlDocument, MissingFilesAndBadOptionsAreRefused) {
   EXPECT_NE(missing.err.find("nope.xml"), std::string::npos);
 
   const auto badEncoding = test::runProcess({kTnctl, "document", kExamples + "annotations.xml", "--to", "yaml"});
-  EXPECT_NE(badEncoding.exitStatus, 0);
+  EXPECT_EQ(badEncoding.exitStatus, 2);
   EXPECT_EQ(badEncoding.out, "");
+  EXPECT_EQ(badEncoding.err.rfind("tnctl: tnctl document: --to: ", 0), 0u) << badEncoding.err;
 }
 
 }  // namespace

@@ -8,6 +8,8 @@
 
 #include <CLI/CLI.hpp>
 
+#include "tools/tnctl/Outcome.h"
+
 namespace tnctl {
 
 // Options every subcommand shares. Filled in by parsing; subcommand
@@ -18,17 +20,8 @@ struct GlobalOptions {
   unsigned timeoutSeconds = 30;                          // how long to wait for a reply
 };
 
-// Subcommand callbacks report failure by throwing CommandFailed after they
-// have printed their one error line; main turns it into exit status 1.
-struct CommandFailed {
-  int status = 1;
-};
-
-// Prints "tnctl: <message>" on stderr and throws CommandFailed.
-[[noreturn]] void fail(const std::string& message);
-
 void addDocumentCommand(CLI::App& app, const GlobalOptions& options);
-void addLintCommand(CLI::App& app, const GlobalOptions& options);  // lint BUNDLE
+void addLintCommand(CLI::App& app, const GlobalOptions& options);  // lint BUNDLE|MANIFEST
 void addRegistryCommands(CLI::App& app, const GlobalOptions& options);  // registry list|show|scan
 void addConsentCommands(CLI::App& app, const GlobalOptions& options);   // consent grant|revoke|list
 

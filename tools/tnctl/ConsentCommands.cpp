@@ -29,6 +29,8 @@ struct ConsentArguments {
 void change(const ConsentArguments& arguments, bool granted) {
   const tn::Result<void> changed = privy::ConsentStore().setConsent(arguments.application, arguments.service, granted);
   if (!changed.ok()) fail(changed.error().localizedDescription());
+  // Silent for people, as a changed setting is; a document for scripts.
+  if (jsonOutcome()) printJsonDocument(tn::Dictionary{{"ok", true}});
 }
 
 tn::Value describe(const std::vector<privy::ConsentRecord>& records) {
@@ -47,9 +49,7 @@ void list(const GlobalOptions& options, const std::string& only) {
     if (only.empty() || application == only) shown.set(application, describe(entries));
   }
   if (options.json) {
-    tn::Result<std::string> text = tn::writeJsonDocument(tn::Value(shown));
-    if (!text.ok()) fail(text.error().localizedDescription());
-    fmt::print("{}", *text);
+    printJsonDocument(tn::Value(shown));
     return;
   }
   for (const auto& [application, entries] : *records) {

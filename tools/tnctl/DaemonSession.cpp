@@ -1,6 +1,7 @@
 #include "tools/tnctl/DaemonSession.h"
 
 #include <chrono>
+#include <cstdlib>
 #include <cstdio>
 #include <functional>
 #include <optional>
@@ -9,6 +10,7 @@
 
 #include "libtenon/client/BlockingReply.h"
 #include "libtenon/client/InternalInconsistency.h"
+#include "platform/relay/ServicePath.h"
 #include "tools/tnctl/ReplyPrinter.h"
 
 namespace tnctl {
@@ -20,11 +22,27 @@ relay::Reply await(const GlobalOptions& options, const ClientOperation& operatio
   return pending.wait(std::chrono::seconds(options.timeoutSeconds));
 }
 
+// Where the daemon's socket is, as this process sees it: the path tells a
+// person which root and which instance tnctl looked for.
+std::string socketPath(const GlobalOptions& options) {
+  tn::Result<std::string> path = relay::servicePath(options.service);
+  return path ? *path : fmt::format("(no socket path: {})", path.error().localizedDescription());
+}
+
+std::string likelyCauses() {
+  const char* root = std::getenv("TENON_ROOT");
+  const std::string rootNow = root != nullptr ? fmt::format("it is \"{}\"", root) : std::string("it is not set");
+  return fmt::format("is tenond running, and is TENON_ROOT set to the root it serves ({})?", rootNow);
+}
+
 [[noreturn]] void failUnreachable(const GlobalOptions& options, const tn::Error& error) {
+  const std::string socket = socketPath(options);
+  const tn::Dictionary details{{"service", options.service}, {"socket", socket}};
   if (tn::isTimedOut(error)) {
-    fail(fmt::format("no reply from tenond at {} within {} seconds", options.service, options.timeoutSeconds));
+    fail(fmt::format("no reply from tenond at {} within {} seconds", socket, options.timeoutSeconds), details);
   }
-  fail(fmt::format("cannot reach tenond at {}: {}", options.service, error.localizedDescription()));
+  fail(fmt::format("cannot reach tenond at {}: {}; {}", socket, error.localizedDescription(), likelyCauses()),
+       details);
 }
 
 std::optional<tn::Error> errorIn(const relay::Reply& reply) {
@@ -46,8 +64,12 @@ void withReply(const GlobalOptions& options, const ClientOperation& operation,
   handle(client, reply);
 }
 
-[[noreturn]] void failWith(const tn::Error& error) {
-  fail(fmt::format("error {}: {}", error.code(), error.localizedDescription()));
+[[noreturn]] void failWith(const tn::Error& error, const FailureExplainer& explain = {}) {
+  std::string message = fmt::format("error {}: {}", error.code(), error.localizedDescription());
+  if (explain) {
+    if (std::optional<std::string> why = explain(error)) message += "\n" + *why;
+  }
+  fail(message, tn::Dictionary{{"errorcode", error.code()}});
 }
 
 }  // namespace
@@ -62,7 +84,7 @@ void runClientOperation(const GlobalOptions& options, const ClientOperation& ope
     } else {
       printReply(client, *reply, options.json, /*succeeded=*/!error, handling.emptySuccess);
     }
-    if (error) failWith(*error);
+    if (error) failWith(*error, handling.explainFailure);
     if (handling.whileConnected) handling.whileConnected(client);
   });
 }

@@ -4,11 +4,12 @@
 // service, run one client operation, wait for its reply, print it, and turn
 // failures into tnctl's error lines and exit status 1:
 //
-//   tnctl: cannot reach tenond at <service>: <reason>
-//   tnctl: no reply from tenond at <service> within <n> seconds
+//   tnctl: cannot reach tenond at <socket path>: <reason>; is tenond running, and is TENON_ROOT set …?
+//   tnctl: no reply from tenond at <socket path> within <n> seconds
 //   tnctl: error <code>: <message>
 
 #include <functional>
+#include <optional>
 #include <string>
 
 #include "libtenon/client/TNDaemonClient.h"
@@ -32,6 +33,10 @@ void runClientOperation(const GlobalOptions& options, const ClientOperation& ope
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation,
                         const ReadablePrinter& readable);
 
+// More about a daemon's error, found by tnctl itself; none when it has
+// nothing to add.
+using FailureExplainer = std::function<std::optional<std::string>(const tn::Error& error)>;
+
 // How a command shows its reply when the generic printing does not fit,
 // and what it does while its connection is still open. Empty members keep
 // the generic behaviour.
@@ -43,6 +48,9 @@ struct ReplyHandling {
   // connection closes: what the daemon ties to the connection (a hold)
   // lasts until it returns.
   std::function<void(tn::TNDaemonClient& client)> whileConnected;
+  // What the daemon's error reply cannot say: lines added to the error
+  // ("tnctl: error 2: unable to register …" then why, found locally).
+  FailureExplainer explainFailure;
 };
 void runClientOperation(const GlobalOptions& options, const ClientOperation& operation, const ReplyHandling& handling);
 

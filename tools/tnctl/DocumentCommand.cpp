@@ -3,7 +3,9 @@
 // Reads a structured-value document in either encoding (XML in Tenon's
 // vocabulary, or JSON) and writes it to stdout in the chosen one. Plug-in
 // authors use it to check a manifest: a bad file gives one line naming the
-// file, the line and the reason, and exit status 1.
+// file, the line and the reason, and exit status 1. Under --json, without
+// --to, the document is written as JSON, so that stdout is one JSON
+// document whatever the outcome.
 
 #include <fmt/format.h>
 
@@ -38,7 +40,11 @@ void addDocumentCommand(CLI::App& app, const GlobalOptions& /*options*/) {
   command->add_option("--to", options->to, "Encoding to write")
       ->check(CLI::IsMember({"xml", "json"}))
       ->capture_default_str();
-  command->callback([options] { runDocument(*options); });
+  command->callback([options, command] {
+    DocumentOptions chosen = *options;
+    if (jsonOutcome() && command->count("--to") == 0) chosen.to = "json";
+    runDocument(chosen);
+  });
 }
 
 }  // namespace tnctl

@@ -1,13 +1,19 @@
-// tnctl add PATH...       register plug-in bundles ("add")
+// tnctl add PATH...       register plug-in bundles ("add"); when the
+//                         registrar refuses one, the daemon's reply says
+//                         only which, so tnctl lints it to say why
 // tnctl remove PATH...    unregister them ("remove"; the daemon requires the
 //                         manager entitlement)
 // tnctl bulk [--flags N]  bulk options ("bulk"; the daemon supports none)
 
+#include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
 
+#include <fmt/format.h>
+
 #include "tools/tnctl/Arguments.h"
+#include "tools/tnctl/BundleLint.h"
 #include "tools/tnctl/Command.h"
 #include "tools/tnctl/DaemonSession.h"
 
@@ -18,6 +24,30 @@ struct PathsOptions {
   std::vector<std::string> paths;
 };
 
+constexpr int64_t kRegistrationErrorCode = 2;  // docs/protocol.md, error codes
+
+// Why the registrar refused the bundle the error names ("unable to
+// register plug-in at PATH"), as lint finds it.
+std::optional<std::string> refusalReasons(const std::vector<std::string>& paths, const tn::Error& error) {
+  if (error.code() != kRegistrationErrorCode) return std::nullopt;
+  const std::string message = error.localizedDescription();
+  auto refused = std::ranges::find_if(paths, [&](const std::string& path) { return message.ends_with(path); });
+  // The daemon names the path it resolved; one path given is the one.
+  if (refused == paths.end() && paths.size() == 1) refused = paths.begin();
+  if (refused == paths.end()) return std::nullopt;
+  const BundleLintResult lint = lintBundle(*refused, {});
+  std::string reasons;
+  for (const LintFinding& finding : lint.findings) {
+    if (finding.severity != LintFinding::Severity::Error) continue;
+    reasons += fmt::format("{}tnctl: {}: {}", reasons.empty() ? "" : "\n", lint.path, finding.message);
+  }
+  if (reasons.empty()) {
+    return fmt::format("tnctl: {}: tnctl lint finds nothing wrong with it; tenond's log has the registrar's reason",
+                       lint.path);
+  }
+  return reasons;
+}
+
 void addPathsCommand(CLI::App& app, const GlobalOptions& options, const char* name, const char* description,
                      void (tn::TNDaemonClient::*operation)(const std::vector<std::string>&,
                                                            tn::TNDaemonClient::ReplyBlock)) {
@@ -26,9 +56,11 @@ void addPathsCommand(CLI::App& app, const GlobalOptions& options, const char* na
   command->add_option("PATH", arguments->paths, "Plug-in bundle paths")->required();
   command->callback([&options, arguments, operation] {
     const std::vector<std::string> paths = absolutePaths(arguments->paths);
+    ReplyHandling handling;
+    handling.explainFailure = [&paths](const tn::Error& error) { return refusalReasons(paths, error); };
     runClientOperation(options, [&](tn::TNDaemonClient& client, tn::TNDaemonClient::ReplyBlock reply) {
       (client.*operation)(paths, std::move(reply));
-    });
+    }, handling);
   });
 }
 

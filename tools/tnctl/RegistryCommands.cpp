@@ -12,6 +12,7 @@
 #include "platform/registrar/Registrar.h"
 #include "platform/value/Document.h"
 #include "tools/tnctl/Command.h"
+#include "tools/tnctl/DisplayDate.h"
 
 namespace tnctl {
 namespace {
@@ -41,7 +42,7 @@ tn::Value describe(const registrar::PlugInRecord& plugIn) {
       {"systemVolume", plugIn.onSystemPartition()},
       {"localizedName", optionalString(plugIn.localizedName())},
       {"dataContainer", optionalString(plugIn.dataContainerPath())},
-      {"registered", tn::formatISO8601(plugIn.registrationDate())},
+      {"registered", displayDate(plugIn.registrationDate())},
   };
 }
 
@@ -58,11 +59,7 @@ tn::Value describe(const registrar::AppRecord& app, const registrar::Registrar& 
   };
 }
 
-void printJson(const tn::Value& value) {
-  tn::Result<std::string> text = tn::writeJsonDocument(value);
-  if (!text) fail(text.error().message().value_or("cannot write JSON"));
-  std::fputs(text->c_str(), stdout);
-}
+void printJson(const tn::Value& value) { printJsonDocument(value); }
 
 std::string flags(bool placeholder, bool system) {
   std::string text;

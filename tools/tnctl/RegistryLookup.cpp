@@ -32,10 +32,14 @@ std::vector<std::string> preferredLanguages() {
 
 class ManifestRegistryLookup : public tn::TNRegistryLookup {
  public:
+  explicit ManifestRegistryLookup(std::string extensionPoints)
+      : extensionPoints_(extensionPoints.empty() ? platformRoot() + std::string(kExtensionPointsDirectory)
+                                                 : std::move(extensionPoints)) {}
+
   std::optional<tn::Dictionary> sdkDictionary(std::string_view extensionPointIdentifier) const override {
     const std::string fileName = std::string(extensionPointIdentifier) + std::string(kManifestSuffix);
     if (!bundle::isPlainFileName(fileName)) return std::nullopt;
-    const std::string path = platformRoot() + std::string(kExtensionPointsDirectory) + "/" + fileName;
+    const std::string path = extensionPoints_ + "/" + fileName;
     tn::Result<tn::Value> document = bundle::readManifestFile(path);
     if (!document || !document->isDictionary()) return std::nullopt;
     return *document->dictionary();
@@ -60,10 +64,15 @@ class ManifestRegistryLookup : public tn::TNRegistryLookup {
     if (!foundTable) return std::nullopt;
     return strings;
   }
+
+ private:
+  const std::string extensionPoints_;
 };
 
 }  // namespace
 
-std::unique_ptr<tn::TNRegistryLookup> makeRegistryLookup() { return std::make_unique<ManifestRegistryLookup>(); }
+std::unique_ptr<tn::TNRegistryLookup> makeRegistryLookup(const std::string& extensionPoints) {
+  return std::make_unique<ManifestRegistryLookup>(extensionPoints);
+}
 
 }  // namespace tnctl

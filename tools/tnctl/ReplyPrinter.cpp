@@ -9,6 +9,7 @@
 
 #include "platform/value/Document.h"
 #include "tools/tnctl/Command.h"
+#include "tools/tnctl/DisplayDate.h"
 
 namespace tnctl {
 namespace {
@@ -43,7 +44,7 @@ void printEntry(const tn::TNDaemonClient& client, const std::string& key, const 
     fmt::print("{}\n", *value.uuid());
     return;
   }
-  fmt::print("{}: {}\n", key, value);
+  fmt::print("{}: {}\n", key, withDisplayDates(value));
 }
 
 void printReadable(const tn::TNDaemonClient& client, const tn::Dictionary& reply, bool succeeded,
@@ -68,9 +69,7 @@ tn::Value decodedForJson(const tn::TNDaemonClient& client, const tn::Dictionary&
 }
 
 void printJson(const tn::TNDaemonClient& client, const tn::Dictionary& reply) {
-  const tn::Result<std::string> text = tn::writeJsonDocument(decodedForJson(client, reply));
-  if (!text) fail(fmt::format("cannot write the reply as JSON: {}", text.error().localizedDescription()));
-  fmt::print("{}", *text);
+  printJsonDocument(decodedForJson(client, reply));
 }
 
 }  // namespace

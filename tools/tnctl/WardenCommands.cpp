@@ -59,11 +59,7 @@ tn::Value askService(const std::string& service, tn::Value request, unsigned tim
   return *reply;
 }
 
-void printJsonReply(const tn::Value& reply) {
-  tn::Result<std::string> document = tn::writeJsonDocument(reply);
-  if (!document.ok()) fail(document.error().localizedDescription());
-  std::fputs(document->c_str(), stdout);
-}
+void printJsonReply(const tn::Value& reply) { printJsonDocument(reply); }
 
 void addBusyCommand(CLI::App& warden, const GlobalOptions& options) {
   struct BusyOptions {

@@ -137,8 +137,8 @@ TEST(TnctlUnreachable, AMissingDaemonGivesOneClearLine) {
   EXPECT_EQ(result.exitStatus, 1);
   EXPECT_EQ(result.out, "");
   // Named by its socket (TnctlUsageTest has the likely causes).
-  EXPECT_EQ(result.err.rfind("tnctl: cannot reach tenond at "
-                             "/nonexistent-tenon-root/run/tenon/relay/com.ostrel.tenon.test.nobody: ", 0), 0u)
+  EXPECT_EQ(result.err.rfind("tnctl: cannot reach tenond: ", 0), 0u) << result.err;
+  EXPECT_NE(result.err.find("/nonexistent-tenon-root/run/tenon/relay/com.ostrel.tenon.test.nobody"), std::string::npos)
       << result.err;
   EXPECT_EQ(lineCount(result.err), 1u) << result.err;
 }

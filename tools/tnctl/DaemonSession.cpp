@@ -1,5 +1,7 @@
 #include "tools/tnctl/DaemonSession.h"
 
+#include "platform/paths/InstancePaths.h"
+
 #include <chrono>
 #include <cstdlib>
 #include <cstdio>
@@ -32,7 +34,11 @@ std::string socketPath(const GlobalOptions& options) {
 std::string likelyCauses() {
   const char* root = std::getenv("TENON_ROOT");
   const std::string rootNow = root != nullptr ? fmt::format("it is \"{}\"", root) : std::string("it is not set");
-  return fmt::format("is tenond running, and is TENON_ROOT set to the root it serves ({})?", rootNow);
+  const bool user = paths::currentLayout().instance == paths::Instance::User;
+  return fmt::format("is tenond running{}, and is TENON_ROOT set to the root it serves ({})?",
+                     user ? " as your per-user instance (TENON_INSTANCE=user; systemctl --user start tenond.socket)"
+                          : "",
+                     rootNow);
 }
 
 [[noreturn]] void failUnreachable(const GlobalOptions& options, const tn::Error& error) {
@@ -41,8 +47,10 @@ std::string likelyCauses() {
   if (tn::isTimedOut(error)) {
     fail(fmt::format("no reply from tenond at {} within {} seconds", socket, options.timeoutSeconds), details);
   }
-  fail(fmt::format("cannot reach tenond at {}: {}; {}", socket, error.localizedDescription(), likelyCauses()),
-       details);
+  // The relay's reason names the socket most of the time: the path is said once.
+  const std::string reason = error.localizedDescription();
+  const std::string where = reason.find(socket) == std::string::npos ? " at " + socket : std::string();
+  fail(fmt::format("cannot reach tenond{}: {}; {}", where, reason, likelyCauses()), details);
 }
 
 std::optional<tn::Error> errorIn(const relay::Reply& reply) {

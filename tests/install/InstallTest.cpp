@@ -57,6 +57,7 @@ TEST(InstalledTree, HoldsProgramsLibraryAndData) {
            std::string(TENON_INSTALL_FULL_DATADIR "/tenon/extension-points/com.ostrel.thumbnail-provider.manifest"),
            std::string(TENON_INSTALL_FULL_DATADIR "/tenon/sandbox-profiles/plugin.manifest"),
            std::string(TENON_INSTALL_FULL_DATADIR "/bash-completion/completions/tnctl"),
+           std::string(TENON_INSTALL_FULL_DATADIR "/doc/tenon/LICENSE"),
            std::string(TENON_INSTALL_FULL_SYSCONFDIR "/tenon/entitlements.d/tnctl.manifest"),
        }) {
     EXPECT_TRUE(fs::exists(staged / installed)) << installed;

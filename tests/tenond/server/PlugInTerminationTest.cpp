@@ -20,15 +20,18 @@ namespace {
 
 using tn::log::Level;
 
-registrar::PlugInPtr record(const std::string& identifier, std::optional<std::string> version) {
+// A record of a bundle with `version` as its BNBundleVersion (none: null).
+registrar::PlugInPtr record(const std::string& identifier, const char* version) {
   registrar::PlugInRecord::Fields fields;
   fields.uuid = tn::UUID::random();
   fields.bundlePath = "/opt/plugins/" + identifier;
   fields.bundleIdentifier = identifier;
   fields.identifier = identifier;
-  fields.bundleVersion = version;
   tn::Dictionary info{{"BNBundleIdentifier", identifier}};
-  if (version) info.set("BNBundleVersion", *version);
+  if (version != nullptr) {
+    fields.bundleVersion = std::string(version);
+    info.set("BNBundleVersion", version);
+  }
   fields.infoDictionary = tn::Value(std::move(info));
   return std::make_shared<registrar::PlugInRecord>(std::move(fields));
 }
@@ -85,7 +88,7 @@ TEST_F(Termination, CompletesOnItsWaiterAfterEveryAnswerWhateverItsStatus) {
   tn::log::ScopedCaptureSink capture;
   Supervisor supervisor;
   Completion completion;
-  const registrar::PlugInList records{record("com.example.a", "2.0"), record("com.example.b", std::nullopt),
+  const registrar::PlugInList records{record("com.example.a", "2.0"), record("com.example.b", nullptr),
                                       record("com.example.c", "1.1")};
   PlugInTermination::start(records, supervisor.remover(), completion.block());
 

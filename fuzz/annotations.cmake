@@ -5,4 +5,4 @@ tenon_fuzzer(annotation_store
   SOURCES AnnotationStoreFuzzer.cpp
           ${PROJECT_SOURCE_DIR}/tenond/database/TNDAnnotationStore.cpp
           ${PROJECT_SOURCE_DIR}/tenond/database/AnnotationFileText.cpp
-  LIBS tn_log tn_value)
+  LIBS tn_paths tn_log tn_value)

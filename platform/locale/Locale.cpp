@@ -15,10 +15,6 @@ namespace {
 constexpr const char* kLocaleKeys[] = {"LC_ALL", "LC_MESSAGES", "LANG"};
 constexpr const char* kConfigurationName = "locale.conf";
 
-std::string platformRoot() {
-  return paths::platformRoot();
-}
-
 std::string_view trimmed(std::string_view text) {
   const auto first = text.find_first_not_of(" \t\r");
   if (first == std::string_view::npos) return {};
@@ -52,7 +48,7 @@ std::map<std::string, std::string> readConfiguration(const std::string& path) {
 
 }  // namespace
 
-std::string localeConfigurationPath() { return platformRoot() + "/etc/" + kConfigurationName; }
+std::string localeConfigurationPath() { return paths::platformRoot() + "/etc/" + kConfigurationName; }
 
 std::string normalizedLocale(std::string_view locale) {
   const auto end = locale.find_first_of(".@");

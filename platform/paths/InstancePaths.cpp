@@ -20,20 +20,37 @@ std::optional<std::string> baseDirectory(const std::string& value, const std::st
   return home + "/" + std::string(fallback);
 }
 
-Layout systemLayout(const std::string& root) {
+// Where an instance keeps each kind of file; the layout names every file.
+struct Directories {
+  std::string runtime;  // sockets and notifications
+  std::string state;    // what it keeps for its users
+  std::string cache;    // what it can rebuild
+  std::string config;   // its settings
+  std::string annotationFile;
+};
+
+Layout layoutIn(Instance instance, const std::string& root, const Directories& directories) {
   Layout layout;
-  layout.instance = Instance::System;
+  layout.instance = instance;
   layout.root = root;
-  layout.relayDirectory = root + "/run/tenon/relay";
-  layout.notificationDirectory = root + "/run/tenon/notify";
-  layout.annotationFile = root + "/var/db/Tenon-Annotations";
-  layout.preferencesDirectory = root + "/var/lib/tenon/prefs";
-  layout.registrarStore = root + "/var/lib/tenon/registrar.sqlite3";
-  layout.containersDirectory = root + "/var/lib/tenon/containers";
-  layout.sandboxKeyFile = root + "/var/lib/tenon/sandbox.key";
-  layout.consentStore = root + "/var/lib/tenon/consent.manifest";
-  layout.configurationFile = root + "/etc/tenon/tenond.manifest";
+  layout.relayDirectory = directories.runtime + "/relay";
+  layout.notificationDirectory = directories.runtime + "/notify";
+  layout.annotationFile = directories.annotationFile;
+  layout.preferencesDirectory = directories.state + "/prefs";
+  layout.containersDirectory = directories.state + "/containers";
+  layout.sandboxKeyFile = directories.state + "/sandbox.key";
+  layout.consentStore = directories.state + "/consent.manifest";
+  layout.registrarStore = directories.cache + "/registrar.sqlite3";
+  layout.configurationFile = directories.config + "/tenond.manifest";
   return layout;
+}
+
+// The machine's instance: everything under the platform root, the
+// annotation file in /var/db.
+Layout systemLayout(const std::string& root) {
+  const std::string kept = root + "/var/lib/tenon";
+  return layoutIn(Instance::System, root,
+                  {root + "/run/tenon", kept, kept, root + "/etc/tenon", root + "/var/db/Tenon-Annotations"});
 }
 
 LayoutResult userLayout(const Environment& environment) {
@@ -48,20 +65,11 @@ LayoutResult userLayout(const Environment& environment) {
     return {std::nullopt, "a per-user instance needs XDG_STATE_HOME, XDG_CACHE_HOME and XDG_CONFIG_HOME, or "
                           "an absolute HOME to find them under; HOME is \"" + environment.home + "\""};
   }
-  Layout layout = systemLayout(environment.root);
-  layout.instance = Instance::User;
-  const std::string runtime = environment.runtimeDirectory + "/tenon";
   const std::string kept = *state + "/tenon";
-  layout.relayDirectory = runtime + "/relay";
-  layout.notificationDirectory = runtime + "/notify";
-  layout.annotationFile = kept + "/Tenon-Annotations";
-  layout.preferencesDirectory = kept + "/prefs";
-  layout.containersDirectory = kept + "/containers";
-  layout.sandboxKeyFile = kept + "/sandbox.key";
-  layout.consentStore = kept + "/consent.manifest";
-  layout.registrarStore = *cache + "/tenon/registrar.sqlite3";
-  layout.configurationFile = *config + "/tenon/tenond.manifest";
-  return {layout, ""};
+  return {layoutIn(Instance::User, environment.root,
+                   {environment.runtimeDirectory + "/tenon", kept, *cache + "/tenon", *config + "/tenon",
+                    kept + "/Tenon-Annotations"}),
+          ""};
 }
 
 }  // namespace

@@ -1,9 +1,6 @@
 #include "tools/tnctl/DaemonSession.h"
 
-#include "platform/paths/InstancePaths.h"
-
 #include <chrono>
-#include <cstdlib>
 #include <cstdio>
 #include <functional>
 #include <optional>
@@ -12,6 +9,7 @@
 
 #include "libtenon/client/BlockingReply.h"
 #include "libtenon/client/InternalInconsistency.h"
+#include "platform/paths/InstancePaths.h"
 #include "platform/relay/ServicePath.h"
 #include "tools/tnctl/ReplyPrinter.h"
 
@@ -32,8 +30,8 @@ std::string socketPath(const GlobalOptions& options) {
 }
 
 std::string likelyCauses() {
-  const char* root = std::getenv("TENON_ROOT");
-  const std::string rootNow = root != nullptr ? fmt::format("it is \"{}\"", root) : std::string("it is not set");
+  const std::string root = paths::platformRoot();
+  const std::string rootNow = !root.empty() ? fmt::format("it is \"{}\"", root) : std::string("it is not set");
   const bool user = paths::currentLayout().instance == paths::Instance::User;
   return fmt::format("is tenond running{}, and is TENON_ROOT set to the root it serves ({})?",
                      user ? " as your per-user instance (TENON_INSTANCE=user; systemctl --user start tenond.socket)"

@@ -1,6 +1,7 @@
 #include "tools/tnctl/Outcome.h"
 
 #include <cstdio>
+#include <optional>
 
 #include <fmt/format.h>
 
@@ -13,21 +14,26 @@ namespace {
 bool gJson = false;             // set by main before commands run
 bool gDocumentPrinted = false;  // a JSON document is on stdout already
 
+// Writes the run's one document; the writer's error when it cannot.
+std::optional<tn::Error> writeDocument(const tn::Value& document) {
+  tn::Result<std::string> text = tn::writeJsonDocument(document);
+  if (!text) return text.error();
+  std::fputs(text->c_str(), stdout);
+  std::fflush(stdout);
+  gDocumentPrinted = true;
+  return std::nullopt;
+}
+
 }  // namespace
 
 void setJsonOutcome(bool json) { gJson = json; }
 bool jsonOutcome() { return gJson; }
 
 void printJsonDocument(const tn::Value& document) {
-  tn::Result<std::string> text = tn::writeJsonDocument(withDisplayDates(document));
-  if (!text) {
-    // Only values tnctl did not check can get here (a date out of range in
-    // a reply): report that instead of printing half a document.
-    fail(fmt::format("cannot write the output as JSON: {}", text.error().localizedDescription()));
-  }
-  std::fputs(text->c_str(), stdout);
-  std::fflush(stdout);
-  gDocumentPrinted = true;
+  // Only values tnctl did not check can fail (a date out of range in a
+  // reply): that is reported instead of half a document.
+  if (const std::optional<tn::Error> error = writeDocument(withDisplayDates(document)))
+    fail(fmt::format("cannot write the output as JSON: {}", error->localizedDescription()));
 }
 
 void fail(const std::string& message, const tn::Dictionary& details, int status) {
@@ -36,10 +42,7 @@ void fail(const std::string& message, const tn::Dictionary& details, int status)
     tn::Dictionary document{{"ok", false}, {"error", message}};
     for (const auto& [key, value] : details) document.set(key, value);
     gDocumentPrinted = true;  // whatever happens below, never a second one
-    if (tn::Result<std::string> text = tn::writeJsonDocument(tn::Value(std::move(document)))) {
-      std::fputs(text->c_str(), stdout);
-      std::fflush(stdout);
-    }
+    (void)writeDocument(tn::Value(std::move(document)));
   }
   throw CommandFailed{status};
 }

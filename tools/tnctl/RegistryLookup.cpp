@@ -17,10 +17,6 @@ constexpr std::string_view kExtensionPointsDirectory = "/usr/share/tenon/extensi
 constexpr std::string_view kManifestSuffix = ".manifest";
 constexpr std::string_view kBaseLanguage = "Base";  // ends every fallback, as in the registrar
 
-std::string platformRoot() {
-  return paths::platformRoot();
-}
-
 // The languages to try, most preferred first: the current locale's
 // fallbacks ("de_AT", "de"), then the base localization.
 std::vector<std::string> preferredLanguages() {
@@ -33,7 +29,7 @@ std::vector<std::string> preferredLanguages() {
 class ManifestRegistryLookup : public tn::TNRegistryLookup {
  public:
   explicit ManifestRegistryLookup(std::string extensionPoints)
-      : extensionPoints_(extensionPoints.empty() ? platformRoot() + std::string(kExtensionPointsDirectory)
+      : extensionPoints_(extensionPoints.empty() ? paths::platformRoot() + std::string(kExtensionPointsDirectory)
                                                  : std::move(extensionPoints)) {}
 
   std::optional<tn::Dictionary> sdkDictionary(std::string_view extensionPointIdentifier) const override {

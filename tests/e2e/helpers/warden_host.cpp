@@ -62,55 +62,63 @@ std::string start(const std::string& plugIn) {
   return "started " + std::to_string((*reply)["pid"].int64().value_or(0));
 }
 
+// The outcome of one request to the daemon.
+struct Asked {
+  std::string failure;  // "error <code> <message>", or empty
+  tn::Value reply;
+};
+
+std::vector<std::shared_ptr<relay::Connection>> holdingConnections;
+
+// Sends `request` to `service` on a connection of its own and waits for
+// the reply; with `keep`, the connection stays open until the host exits
+// (what the daemon ties to it, a hold, lasts as long).
+Asked ask(const std::string& service, tn::Value request, bool keep) {
+  auto queue = tn::dispatch::SerialQueue::create("host");
+  auto connection = relay::Connection::connectToService(service, queue);
+  if (!connection.ok()) return {"error 0 " + connection.error().description(), {}};
+  (*connection)->setEventHandler([](const relay::Event&) {});
+  (*connection)->resume();
+  std::promise<relay::Reply> promise;
+  (*connection)->sendWithReply(std::move(request), queue,
+                               [&](relay::Reply reply) { promise.set_value(std::move(reply)); });
+  relay::Reply reply = promise.get_future().get();
+  if (keep) {
+    holdingConnections.push_back(*connection);
+  } else {
+    (*connection)->cancel();
+  }
+  if (!reply.ok()) return {"error 0 " + reply.error().description(), {}};
+  if (const auto code = (*reply)["errorcode"].uint64()) {
+    const std::string* message = (*reply)["error"].string();
+    return {"error " + std::to_string(*code) + " " + (message ? *message : ""), {}};
+  }
+  return {"", *reply};
+}
+
 std::string ready(const std::string& arguments) {
   const std::size_t space = arguments.find(' ');
   const std::optional<tn::UUID> uuid =
       space == std::string::npos ? std::nullopt : tn::UUID::parse(arguments.substr(space + 1));
   if (!uuid) return "error 0 usage: ready <service> <uuid>";
-  auto queue = tn::dispatch::SerialQueue::create("host");
-  auto connection = relay::Connection::connectToService(arguments.substr(0, space), queue);
-  if (!connection.ok()) return "error 0 " + connection.error().description();
-  (*connection)->setEventHandler([](const relay::Event&) {});
-  (*connection)->resume();
-  std::promise<relay::Reply> promise;
-  (*connection)->sendWithReply(
-      tn::Dictionary{{"request", "ready"}, {"version", 3}, {"uuids", tn::Array{tn::Value(*uuid)}}}, queue,
-      [&](relay::Reply reply) { promise.set_value(std::move(reply)); });
-  relay::Reply reply = promise.get_future().get();
-  (*connection)->cancel();
-  if (!reply.ok()) return "error 0 " + reply.error().description();
-  if (const auto code = (*reply)["errorcode"].uint64()) {
-    const std::string* message = (*reply)["error"].string();
-    return "error " + std::to_string(*code) + " " + (message ? *message : "");
-  }
-  return "ready";
+  const Asked asked = ask(arguments.substr(0, space),
+                          tn::Dictionary{{"request", "ready"}, {"version", 3}, {"uuids", tn::Array{tn::Value(*uuid)}}},
+                          false);
+  return asked.failure.empty() ? "ready" : asked.failure;
 }
-
-std::vector<std::shared_ptr<relay::Connection>> holdingConnections;
 
 std::string hold(const std::string& arguments) {
   const std::size_t first = arguments.find(' ');
   const std::size_t second = first == std::string::npos ? first : arguments.find(' ', first + 1);
   if (second == std::string::npos) return "error 0 usage: hold <service> <flags> <path>";
-  auto queue = tn::dispatch::SerialQueue::create("host");
-  auto connection = relay::Connection::connectToService(arguments.substr(0, first), queue);
-  if (!connection.ok()) return "error 0 " + connection.error().description();
-  (*connection)->setEventHandler([](const relay::Event&) {});
-  (*connection)->resume();
-  std::promise<relay::Reply> promise;
-  (*connection)->sendWithReply(
-      tn::Dictionary{{"request", "lock"}, {"version", 3},
-                     {"flags", std::stoull(arguments.substr(first + 1, second - first - 1), nullptr, 0)},
-                     {"paths", tn::Array{tn::Value(arguments.substr(second + 1))}}},
-      queue, [&](relay::Reply reply) { promise.set_value(std::move(reply)); });
-  relay::Reply reply = promise.get_future().get();
-  holdingConnections.push_back(*connection);
-  if (!reply.ok()) return "error 0 " + reply.error().description();
-  if (const auto code = (*reply)["errorcode"].uint64()) {
-    const std::string* message = (*reply)["error"].string();
-    return "error " + std::to_string(*code) + " " + (message ? *message : "");
-  }
-  const std::optional<tn::UUID> token = (*reply)["uuids"].uuid();
+  const Asked asked = ask(arguments.substr(0, first),
+                          tn::Dictionary{{"request", "lock"}, {"version", 3},
+                                         {"flags", std::stoull(arguments.substr(first + 1, second - first - 1),
+                                                               nullptr, 0)},
+                                         {"paths", tn::Array{tn::Value(arguments.substr(second + 1))}}},
+                          true);
+  if (!asked.failure.empty()) return asked.failure;
+  const std::optional<tn::UUID> token = asked.reply["uuids"].uuid();
   return token ? "held " + token->string() : "error 0 no token in the reply";
 }
 

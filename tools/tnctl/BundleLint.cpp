@@ -75,10 +75,10 @@ class Linter {
   BundleLintResult& result_;
 };
 
-void lintRecord(const tn::Value& info, const std::string& extensionPoints, BundleLintResult& result, Linter& lint) {
+void lintRecord(const tn::Value& info, const tn::TNRegistryLookup& lookup, BundleLintResult& result, Linter& lint) {
   const std::shared_ptr<tn::TNPlugInCore> record = buildRecord(result.path, info);
   if (!record) return lint.error("the plug-in record cannot be built");
-  record->resolveSDK(*makeRegistryLookup(extensionPoints));
+  record->resolveSDK(lookup);
   if (std::optional<tn::Error> problem = record->diagnose()) {
     return lint.error(problem->localizedDescription(), problem->code());
   }
@@ -108,13 +108,15 @@ BundleLintResult lintBundle(const std::string& given, const std::string& extensi
   }
   for (LintFinding& finding : checkManifestKeys(*info)) lint.add(std::move(finding));
   if (std::optional<std::string> missing = missingPlugInDictionary(*info)) lint.error(*missing);
-  if (std::optional<LintFinding> point = checkExtensionPoint(*info, *makeRegistryLookup(extensionPoints))) {
+  // The extension points are read once, for both questions that need them.
+  const std::unique_ptr<tn::TNRegistryLookup> lookup = makeRegistryLookup(extensionPoints);
+  if (std::optional<LintFinding> point = checkExtensionPoint(*info, *lookup)) {
     lint.add(std::move(*point));
   }
   // The record's diagnosis would speak of what the author did not write (a
   // key an SDK supplies, a key of the wrong kind as missing): only a
   // manifest without such errors gets it.
-  if (!lint.failed()) lintRecord(*info, extensionPoints, result, lint);
+  if (!lint.failed()) lintRecord(*info, *lookup, result, lint);
   return result;
 }
 

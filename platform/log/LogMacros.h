@@ -10,7 +10,8 @@
 // off for that log object the call costs one branch: no argument is
 // evaluated and nothing is formatted, so arguments may be expensive
 // (descriptions of messages, UUID strings). The format string literal's
-// address identifies the call site to the rate limiter (RateLimiter.h).
+// address identifies the call site to the rate limiter (RateLimiter.h),
+// which is asked first: a suppressed line is not formatted either.
 
 #pragma once
 
@@ -22,10 +23,10 @@
 #define TN_LOG_AT_LEVEL(tn_level_, tn_log_, tn_format_, ...)                          \
   do {                                                                                \
     ::tn::log::Log& tn_log_object_ = (tn_log_);                                       \
-    if (tn_log_object_.enabled(tn_level_)) [[unlikely]] {                             \
-      tn_log_object_.write(tn_level_,                                                 \
-                           ::fmt::format(FMT_STRING(tn_format_) __VA_OPT__(, ) __VA_ARGS__), \
-                           static_cast<const void*>(tn_format_));                     \
+    if (tn_log_object_.enabled(tn_level_) &&                                          \
+        tn_log_object_.admit(tn_level_, static_cast<const void*>(tn_format_))) [[unlikely]] { \
+      tn_log_object_.writeAdmitted(tn_level_,                                         \
+                                   ::fmt::format(FMT_STRING(tn_format_) __VA_OPT__(, ) __VA_ARGS__)); \
     }                                                                                 \
   } while (0)
 

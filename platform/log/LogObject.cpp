@@ -64,14 +64,19 @@ void writeSummaries(const std::vector<RateLimiter::Summary>& summaries) {
 }  // namespace detail
 
 void Log::write(Level level, std::string_view text, const void* site) const {
-  if (const ContextId context = currentContext(); context != 0 && site != nullptr) {
-    const RateLimiter::Decision decision =
-        detail::rateLimiter().admit(context, site, *this, level, RateLimiter::Clock::now());
-    detail::writeSummaries(decision.summaries);
-    if (!decision.write) return;
-  }
-  emit(subsystem_, category_, level, text);
+  if (admit(level, site)) writeAdmitted(level, text);
 }
+
+bool Log::admit(Level level, const void* site) const {
+  const ContextId context = currentContext();
+  if (context == 0 || site == nullptr) return true;
+  const RateLimiter::Decision decision =
+      detail::rateLimiter().admit(context, site, *this, level, RateLimiter::Clock::now());
+  detail::writeSummaries(decision.summaries);
+  return decision.write;
+}
+
+void Log::writeAdmitted(Level level, std::string_view text) const { emit(subsystem_, category_, level, text); }
 
 void Log::setEnabledLevels(unsigned mask) noexcept {
   enabledMask_.store(withAlwaysOnLevels(mask), std::memory_order_relaxed);

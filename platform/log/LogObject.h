@@ -46,6 +46,13 @@ class Log {
   // without a site the line is never suppressed.
   void write(Level level, std::string_view text, const void* site = nullptr) const;
 
+  // write() in two steps, so that a line the rate limiter suppresses is
+  // never formatted (the macros): admit() decides about a line of `site`
+  // at `level` (writing the summaries owed), and writeAdmitted() sends a
+  // line that was admitted.
+  bool admit(Level level, const void* site) const;
+  void writeAdmitted(Level level, std::string_view text) const;
+
   // Sets which levels are enabled (bit 1 << level). Used by the level
   // settings; default and error stay on whatever `mask` says.
   void setEnabledLevels(unsigned mask) noexcept;

@@ -47,6 +47,23 @@ void rememberKey(const std::string& path, const struct stat& status, const Sandb
   cache[path] = CachedKey{status.st_dev, status.st_ino, key};
 }
 
+// The keys this process issues with, by path, kept from the first read or
+// creation on: issuing a token costs no file-system work. Replacing the key
+// file under a running issuer is therefore not seen by it (docs/sandbox-tokens.md).
+std::map<std::string, SandboxKey, std::less<>> issuingKeys;  // guarded by cacheMutex
+
+std::optional<SandboxKey> keptIssuingKey(const std::string& path) {
+  const std::lock_guard lock(cacheMutex);
+  const auto found = issuingKeys.find(path);
+  if (found == issuingKeys.end()) return std::nullopt;
+  return found->second;
+}
+
+SandboxKey keepIssuingKey(const std::string& path, const SandboxKey& key) {
+  const std::lock_guard lock(cacheMutex);
+  return issuingKeys.try_emplace(path, key).first->second;
+}
+
 // Reads the key file at path, which must be a regular file of exactly the
 // key's size.
 tn::Result<SandboxKey> readKeyFile(const std::string& path) {
@@ -111,12 +128,14 @@ tn::Result<SandboxKey> readSandboxKey() { return readKeyFile(sandboxKeyPath()); 
 
 tn::Result<SandboxKey> loadOrCreateSandboxKey() {
   const std::string path = sandboxKeyPath();
+  if (std::optional<SandboxKey> kept = keptIssuingKey(path)) return *kept;
   // Another process may remove the key between our link and our read; a few
   // rounds settle that, and a file that keeps vanishing is an error.
   constexpr int kAttempts = 4;
   for (int attempt = 0; attempt < kAttempts; ++attempt) {
     tn::Result<SandboxKey> existing = readKeyFile(path);
-    if (existing || existing.error().code() != ENOENT) return existing;
+    if (existing) return keepIssuingKey(path, *existing);
+    if (existing.error().code() != ENOENT) return existing;
     tn::Result<void> created = createKeyFile(path);
     if (!created && created.error().code() != EEXIST) return created.error();
     // Created here or by a process that raced us: read whichever won.

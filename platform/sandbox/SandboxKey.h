@@ -28,7 +28,10 @@ std::string sandboxKeyPath();
 // The key at sandboxKeyPath(), created first when there is none. Errors have
 // domain kSandboxErrorDomain, an errno value as code and a message naming the
 // file ("/x/sandbox.key: cannot create: Permission denied"); a key file of
-// the wrong size is refused with EINVAL and left alone.
+// the wrong size is refused with EINVAL and left alone. The key is the
+// issuer's: once read or created it is kept in memory for its path, so later
+// calls do no file-system work, and a key file replaced while this process
+// runs is not seen by it.
 tn::Result<SandboxKey> loadOrCreateSandboxKey();
 
 // The key at sandboxKeyPath() without ever creating it: ENOENT when there is

@@ -91,6 +91,8 @@ class Writer {
   // Where the next byte would go.
   const uint8_t* cursor() const { return cursor_; }
 
+  void writeMapHead(uint64_t count) { writeHead(kMap, count); }
+
   void write(const Value& value) {
     switch (value.kind()) {
       case Value::Kind::Null: *cursor_++ = initialByte(kSimple, kNull); break;
@@ -199,6 +201,17 @@ void appendCbor(Bytes& out, const Value& value, CborDialect dialect) {
   Writer writer(out.data() + start, dialect);
   writer.write(value);
   assert(writer.cursor() == out.data() + out.size());
+}
+
+void appendCborMapHead(Bytes& out, uint64_t count) {
+  const size_t start = out.size();
+  out.resize(start + headSize(count));
+  Writer(out.data() + start, CborDialect::Wire).writeMapHead(count);
+}
+
+void appendCborEntry(Bytes& out, std::string_view key, const Value& value, CborDialect dialect) {
+  appendCbor(out, Value(key), dialect);
+  appendCbor(out, value, dialect);
 }
 
 Bytes encodeCbor(const Value& value, CborDialect dialect) {

@@ -5,7 +5,6 @@
 #include <cstring>
 #include <utility>
 
-#include "libtenon/model/TNSandboxExtension.h"
 #include "platform/value/Date.h"
 #include "platform/log/Log.h"
 #include "platform/paths/InstancePaths.h"
@@ -17,16 +16,8 @@ constexpr std::string_view kHubProtocolVersionKey = "HubProtocolVersion";
 constexpr std::string_view kOldStyleKey = "Tenon";
 constexpr std::string_view kPlugInKey = "XTExtension";
 constexpr std::string_view kAttributesKey = "XTExtensionAttributes";
-constexpr std::string_view kSharedKey = "Shared";
-constexpr std::string_view kBundleIdentifierKey = "BNBundleIdentifier";
 
 tn::Error misconfigured(std::string message) { return tn::TNMakeError(tn::kUnusablePlugInErrorCode, std::move(message)); }
-
-// The system's text for an errno-coded sandbox failure.
-std::string failureText(const tn::Error& error) {
-  const char* text = strerrordesc_np(static_cast<int>(error.code()));
-  return text ? text : error.localizedDescription();
-}
 
 }  // namespace
 
@@ -136,67 +127,6 @@ std::optional<tn::Error> TNDPlugIn::diagnose() const {
     return misconfigured("plug-ins outside containing apps must be in /System");
   }
   return std::nullopt;
-}
-
-tn::Dictionary TNDPlugIn::issueResourceExtensions(const tn::Value& resources) const {
-  tn::Array list;
-  if (resources.isString()) {
-    list.push_back(resources);
-  } else if (const tn::Array* array = resources.array()) {
-    list = *array;
-  }
-  tn::Dictionary tokens;
-  const std::optional<tn::URL> bundle = url();
-  if (!bundle) return tokens;
-  for (const tn::Value& element : list) {
-    const std::string* resource = element.string();
-    if (resource == nullptr) continue;
-    tn::Result<std::string> token = issueResourceExtension(*bundle, *resource);
-    if (!token.ok() && token.error().code() == EPERM) {
-      TN_LOG_INFO(tn::log::ops(), "refusing extension for resource {} of plug-in at {}: {}", *resource,
-                  bundle->path(), token.error().localizedDescription());
-      continue;
-    }
-    if (!token.ok()) {
-      TN_LOG_INFO(tn::log::ops(), "failed to make extension for {} in plug-in at {}: {}", *resource,
-                  bundle->path(), failureText(token.error()));
-      continue;
-    }
-    tokens.set(*resource, tn::Value(*token));
-  }
-  return tokens;
-}
-
-tn::Result<std::string> TNDPlugIn::issueResourceExtension(const tn::URL& bundle, const std::string& resource) const {
-  {
-    std::lock_guard lock(resourcePathsMutex_);
-    if (const auto known = resourcePaths_.find(resource); known != resourcePaths_.end()) {
-      return tn::issueCheckedResourceExtension(known->second);
-    }
-  }
-  tn::Result<std::string> path = tn::bundleResourcePath(bundle.path(), resource);
-  if (!path) return path.error();
-  {
-    std::lock_guard lock(resourcePathsMutex_);
-    resourcePaths_.emplace(resource, *path);
-  }
-  return tn::issueCheckedResourceExtension(*path);
-}
-
-void TNDPlugIn::augmentForm(tn::Dictionary& form) const {
-  tn::Value resources = pluginKey(kSharedKey);
-  if (isAppExtension()) resources = tn::Value(tn::Array{tn::Value(".")});
-  if (!resources.isNull()) form.set("extensions", tn::Value(issueResourceExtensions(resources)));
-  if (isData()) return;
-  const tn::Value bundleIdentifier = infoKey(kBundleIdentifierKey);
-  const std::string name = bundleIdentifier.string() ? *bundleIdentifier.string() : std::string();
-  tn::Result<std::string> token = tn::issueServiceExtension(name);
-  if (token.ok()) {
-    form.set("service-extension", tn::Value(*token));
-  } else {
-    TN_LOG_INFO(tn::log::ops(), "failed to make mach extension for {} in plug-in at {}: {}", name,
-                path().value_or(""), failureText(token.error()));
-  }
 }
 
 tn::Dictionary TNDPlugIn::prunedInfoDictionaryFor(const tn::Dictionary& dictionary) {

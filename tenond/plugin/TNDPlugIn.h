@@ -85,10 +85,27 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   // ($TENON_ROOT/System/). Errors of code 12.
   std::optional<tn::Error> diagnose() const;
 
+  // --- Forms (TNDPlugInForms.cpp) ---
+  //
+  // A form depends on the request only through the user's annotation. The
+  // rest (the exported form, the sandbox extensions that complete it, and
+  // its typed encoding) depends only on this record and the registrar's
+  // knowledge of it, so it is made once per knowledge generation and kept
+  // (the encoding and the tokens, not the form's dictionary):
+  // answering a lookup then costs the annotation's encoding and a copy of
+  // bytes. Tokens can be kept because a token depends only on the key and
+  // its subject; extensions are kept only when every token was issued, so a
+  // failure is tried (and logged) again on the next request.
+
   // Adds "extensions" (file extensions for "Shared", or for the whole bundle
   // of an application extension) and "service-extension" (a service-lookup
   // extension for the bundle identifier, unless a data plug-in) to a form.
   void augmentForm(tn::Dictionary& form) const;
+  // The typed encoding (tn::encodeTyped) of the form a lookup answers with:
+  // the exported form, or an empty one when the plug-in cannot be exported
+  // (logged as an error on "ops"), with "annotations" set to `annotations`,
+  // then augmented. Byte for byte what encoding that dictionary would give.
+  tn::Value encodedForm(const tn::Dictionary& annotations) const;
   // Resource (relative path, "." for the bundle) to its file extension
   // token; resources whose extension fails are logged and left out. A
   // resource that is absolute, has a ".." component or resolves outside the
@@ -208,7 +225,26 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   static std::string systemVolumePrefix();
 
  private:
+  // The entries augmentForm adds, and whether every token was issued.
+  struct Augmentation {
+    tn::Dictionary entries;  // "extensions" and "service-extension", as present
+    bool complete = true;
+  };
+  struct KeptForm;
+
   void copyRegistrarFacts(const registrar::PlugInRecord& record, const tn::TNRegistryLookup& lookup);
+  Augmentation augmentation() const;
+  tn::Dictionary issueResourceExtensions(const tn::Value& resources, bool& complete) const;
+  // What is kept for the registrar's current knowledge, made when missing,
+  // with the extensions made along when they could not be kept.
+  struct CurrentForm {
+    std::shared_ptr<const KeptForm> kept;
+    std::optional<Augmentation> augmentation;
+    // The extensions a form of this record gets now.
+    tn::Dictionary augmentationEntries(const TNDPlugIn& plugIn) const;
+  };
+  CurrentForm currentForm() const;
+  CurrentForm makeKeptForm(const std::optional<tn::UUID>& knowledge) const;
 
   const std::shared_ptr<const registrar::Registrar> registrar_;
   std::optional<tn::URL> dataContainerURL_;  // set once, before the record is shared
@@ -223,6 +259,8 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   // bundle when it was checked, and the token names exactly that path.
   mutable std::mutex resourcePathsMutex_;
   mutable std::unordered_map<std::string, std::string> resourcePaths_;
+  mutable std::mutex keptFormMutex_;
+  mutable std::shared_ptr<const KeptForm> keptForm_;  // guarded by keptFormMutex_
 };
 
 }  // namespace tnd

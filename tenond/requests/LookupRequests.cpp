@@ -44,12 +44,14 @@ std::shared_ptr<TNDPlugIn> Transaction::findPlugInByPathURL(const std::string& t
   return server()->findPlugInAtPath(*url);
 }
 
-void Transaction::addAnnotationForPlugIn(const TNDPlugIn& plugIn, tn::Dictionary& form) {
+tn::Dictionary Transaction::annotationForForm(const TNDPlugIn& plugIn) {
   std::optional<tn::Dictionary> annotation = server()->annotationForPlugIn(plugIn);
-  if (!annotation) {
-    annotation = pluginShouldBeAutoEnabled(plugIn) ? tn::Dictionary{{"election", tn::Value(1)}} : tn::Dictionary();
-  }
-  form.set("annotations", tn::Value(std::move(*annotation)));
+  if (annotation) return std::move(*annotation);
+  return pluginShouldBeAutoEnabled(plugIn) ? tn::Dictionary{{"election", tn::Value(1)}} : tn::Dictionary();
+}
+
+void Transaction::addAnnotationForPlugIn(const TNDPlugIn& plugIn, tn::Dictionary& form) {
+  form.set("annotations", tn::Value(annotationForForm(plugIn)));
 }
 
 std::shared_ptr<TNDPlugIn> Transaction::findPlugInByFallbackPath(const tn::UUID& uuid, const tn::Value& path) {
@@ -106,17 +108,9 @@ void Transaction::findPlugIn() {
   }
   TN_LOG_DEFAULT(tn::log::ops(), "plugin found {}", describe(*plugIn));
 
-  tn::Dictionary form;
-  if (tn::Result<tn::Dictionary> exported = plugIn->exportForm(); exported.ok()) {
-    form = std::move(*exported);
-  } else {
-    TN_LOG_ERROR(tn::log::ops(), "failed to export matching plug-in {}: {}",
-                 plugIn->uuidText(), exported.error().description());
-  }
-  addAnnotationForPlugIn(*plugIn, form);
-  plugIn->augmentForm(form);
-  const tn::Value encoded = tn::TNDaemonClient::convertToRelay(tn::Value(std::move(form)), version());
-  if (!encoded.isNull()) reply().set("matches", encoded);
+  // The record keeps everything of its form but the annotation.
+  const tn::Value encoded = plugIn->encodedForm(annotationForForm(*plugIn));
+  if (version() == kCurrentProtocolVersion) reply().set("matches", encoded);
   done();
 }
 

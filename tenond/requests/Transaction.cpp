@@ -68,15 +68,57 @@ void Transaction::route(const std::string* type) {
 
 void Transaction::unrecognized() { fail(kErrorInvalidRequest, std::string("unrecognized request")); }
 
+namespace {
+
+// Replies whose payload reaches this size are encoded and written on the
+// connection's queue; smaller ones at once. Handing a reply to another queue
+// costs a thread wake-up, more than encoding and writing a few kilobytes
+// (docs/performance.md): a lookup's reply (one form, 1-2 KB) is sent where
+// it was made, while a discovery of thousands of plug-ins (megabytes) does
+// not hold the queue every client shares while its bytes are copied.
+constexpr std::size_t kInlineReplyBytes = 16 * 1024;
+
+// The bytes a reply's top-level strings and data carry: what its encoding
+// costs, near enough, since forms travel as data (the typed encoding).
+std::size_t payloadBytes(const tn::Dictionary& reply) {
+  std::size_t bytes = 0;
+  for (const auto& [key, value] : reply) {
+    bytes += key.size();
+    if (const tn::Bytes* data = value.data()) bytes += data->size();
+    if (const std::string* text = value.string()) bytes += text->size();
+    if (const tn::Array* array = value.array()) bytes += array->size() * 64;
+  }
+  return bytes;
+}
+
+}  // namespace
+
 void Transaction::done() {
   saveStoredAnnotations();
+  const bool large = payloadBytes(reply_) >= kInlineReplyBytes;
   tn::Value reply(reply_);
   TN_PROBE_REQUEST_OUTPUT(client_->pid(), [&] { return reply.description(); });
-  if (auto c = connection()) {
-    tn::Result<void> sent = c->trySendReply(request_, std::move(reply));
-    if (!sent && relay::isRelayError(sent.error(), relay::RelayErrorCode::MessageTooLarge)) {
-      sendReplyTooLarge(*c, sent.error());
-    }
+  const std::shared_ptr<relay::Connection> c = connection();
+  if (!c) {
+    request_.charge.reset();
+    return;
+  }
+  std::atomic<uint32_t>& queued = client_->queuedReplies();
+  if (!large && queued.load() == 0) {
+    sendReply(*c, std::move(reply));
+    return;
+  }
+  ++queued;
+  c->eventQueue()->async([self = shared_from_this(), c, reply = std::move(reply)]() mutable {
+    self->sendReply(*c, std::move(reply));
+    --self->client_->queuedReplies();
+  });
+}
+
+void Transaction::sendReply(relay::Connection& connection, tn::Value reply) {
+  tn::Result<void> sent = connection.trySendReply(request_, std::move(reply));
+  if (!sent && relay::isRelayError(sent.error(), relay::RelayErrorCode::MessageTooLarge)) {
+    sendReplyTooLarge(connection, sent.error());
   }
   request_.charge.reset();
 }

@@ -60,11 +60,13 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   // Runs the request. On the service queue.
   void dispatch();
 
-  // Sends the reply on the connection (nothing when it is gone). A reply
-  // too large for a frame is replaced by an error reply (21), so that every
-  // request still gets exactly one answer. Gives the request's share of the
-  // client's budget back. Annotation changes the request made are written
-  // to the annotation file first (storeAnnotation).
+  // Sends the reply on the connection (nothing when it is gone): encoded
+  // and written on the connection's own queue, after the caller's work. A
+  // reply too large for a frame is replaced by an error reply (21), so that
+  // every request still gets exactly one answer. Gives the request's share
+  // of the client's budget back once the reply has left. Annotation changes
+  // the request made are written to the annotation file first
+  // (storeAnnotation).
   void done();
   // Sets errorcode and error (when given) in the reply, then done().
   void fail(uint64_t code, const std::optional<std::string>& message);
@@ -105,6 +107,8 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   static const Route kRoutes[];
 
   void route(const std::string* type);
+  // On the connection's queue: encodes and writes the reply.
+  void sendReply(relay::Connection& connection, tn::Value reply);
   void sendReplyTooLarge(relay::Connection& connection, const tn::Error& error);
   void unrecognized();
 
@@ -116,6 +120,9 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   std::shared_ptr<TNDPlugIn> findPlugInByFallbackPath(const tn::UUID& uuid, const tn::Value& path);
   // Sets the form's "annotations": the stored annotation, else an empty one.
   void addAnnotationForPlugIn(const TNDPlugIn& plugIn, tn::Dictionary& form);
+  // The "annotations" a form carries: the stored annotation, else an empty
+  // one (or an election of 1 for a plug-in enabled automatically).
+  tn::Dictionary annotationForForm(const TNDPlugIn& plugIn);
   // The policy hook for plug-ins without a stored annotation: no for all.
   static bool pluginShouldBeAutoEnabled(const TNDPlugIn& plugIn);
 

@@ -80,6 +80,10 @@ class TNDRelayClient : public TNDHost, public std::enable_shared_from_this<TNDRe
 
   bool acceptWork() const { return acceptWork_; }
   void setAcceptWork(bool accept) { acceptWork_ = accept; }
+  // Replies handed to the connection's queue and not yet written: while
+  // there are any, later replies take the same way, so that replies leave
+  // in the order of their requests (Transaction::done).
+  std::atomic<uint32_t>& queuedReplies() { return queuedReplies_; }
   // Only touched by units of work on the service queue.
   uint32_t requestCount() const { return requestCount_; }
   void setRequestCount(uint32_t count) { requestCount_ = count; }
@@ -105,6 +109,7 @@ class TNDRelayClient : public TNDHost, public std::enable_shared_from_this<TNDRe
   void handleRequest(const relay::Message& message);
 
   std::atomic<bool> acceptWork_{true};
+  std::atomic<uint32_t> queuedReplies_{0};
   uint32_t requestCount_ = 0;
   std::weak_ptr<relay::Connection> connection_;
   const std::shared_ptr<TNDServer> server_;

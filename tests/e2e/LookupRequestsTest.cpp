@@ -7,9 +7,12 @@
 
 #include <filesystem>
 
+#include "platform/relay/Frame.h"
 #include "platform/value/Document.h"
+#include "platform/value/TypedEncoding.h"
 #include "tests/platform/bundle/BundleTestSupport.h"
 #include "tests/support/DaemonProcess.h"
+#include "tests/support/FrameSocket.h"
 #include "tests/support/Subprocess.h"
 #include "tests/support/TrustedInstall.h"
 
@@ -86,6 +89,42 @@ TEST_F(Lookup, UnknownPlugInsAndAPathThatNamesNothingAreNotFound) {
   const std::string both = R"({"request":"find","version":3,"uuids":")" + registered() + R"(","paths":"file:///nowhere"})";
   EXPECT_EQ(tnctl({"request", both}).err, "tnctl: error 15: Cannot locate PlugIn\n");
   EXPECT_NE(daemon_.log().find("plugin not found"), std::string::npos);
+}
+
+// A reply's "replyTo".
+uint64_t replyTo(const Bytes& frame) { return relay::loadBigEndian64(frame.data() + relay::kFrameLengthSize + 8); }
+
+TEST_F(Lookup, RepliesLeaveInTheOrderOfTheirRequests) {
+  // Three hundred plug-ins more: a discovery of all of them answers a third
+  // of a megabyte, which is encoded and written on the connection's queue,
+  // while a lookup's reply, made after it, is ready much sooner.
+  const auto generated = runProcess(
+      {std::string(TENON_SOURCE_DIR "/bench/generate-registry-fixture"), daemon_.root(), "1", "300"}, {});
+  ASSERT_EQ(generated.exitStatus, 0) << generated.err;
+  FrameSocket socket(daemon_.socketPath());
+  const Value match(Dictionary{{"request", "match"}, {"version", 3}});
+  std::size_t offered = 0;
+  for (int i = 0; i < 500 && offered < 300; ++i) {
+    const Result<Value> forms = decodeTyped(socket.request(match)["matches"]);
+    offered = forms.ok() && forms->isArray() ? forms->array()->size() : 0;
+    if (offered < 300) std::this_thread::sleep_for(std::chrono::milliseconds(20));
+  }
+  ASSERT_GE(offered, 300u) << daemon_.log();
+
+  const Value find(Dictionary{{"request", "find"}, {"version", 3}, {"uuids", Value(*UUID::parse(registered()))}});
+  ASSERT_TRUE(socket.send(match));
+  for (int i = 0; i < 3; ++i) ASSERT_TRUE(socket.send(find));
+  std::vector<uint64_t> order;
+  for (int i = 0; i < 4; ++i) {
+    Bytes frame;
+    ASSERT_TRUE(socket.receive(frame));
+    order.push_back(replyTo(frame));
+    if (i == 0) {
+      EXPECT_GT(frame.size(), 16u * 1024) << "the discovery's reply is one the connection's queue writes";
+    }
+  }
+  ASSERT_EQ(order.size(), 4u);
+  for (std::size_t i = 1; i < order.size(); ++i) EXPECT_EQ(order[i], order[i - 1] + 1) << "reply " << i;
 }
 
 }  // namespace

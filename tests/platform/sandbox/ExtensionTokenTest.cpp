@@ -181,6 +181,15 @@ TEST_F(ExtensionTokenTest, TheKeyFileIsCreatedOnceWithMode0600) {
   EXPECT_EQ(*readSandboxKey(), *key);
   EXPECT_EQ(*loadOrCreateSandboxKey(), *key);
 
+  // The issuer keeps its key: a file replaced under it is not seen by it
+  // (no file-system work per token), while a consumer reads the new one.
+  const std::string replacement = std::string(32, 'k');
+  const std::string aside = keyPath() + ".new";
+  tn::test::writeFile(aside, replacement, 0600);
+  ASSERT_EQ(::rename(aside.c_str(), keyPath().c_str()), 0);
+  EXPECT_EQ(*loadOrCreateSandboxKey(), *key);
+  EXPECT_EQ(*readSandboxKey(), keyOf('k'));
+
   // A key file of the wrong size is refused and left alone.
   const std::string otherRoot = root_ / "other";
   tn::test::writeFile(otherRoot + "/var/lib/tenon/sandbox.key", "short", 0600);

@@ -111,6 +111,27 @@ TEST(CborEncoding, InvalidUtf8IsRepairedSoThePeerCanReadIt) {
 
 // ---- Decoding what other encoders may write ----
 
+TEST(CborEncoding, AMapWrittenPieceByPieceIsTheMapsEncoding) {
+  // Counts on both sides of each head size, values of every kind, and text
+  // that needs repair.
+  for (const std::size_t count : {0u, 1u, 23u, 24u, 255u, 256u}) {
+    Dictionary dictionary;
+    for (std::size_t i = 0; i < count; ++i) {
+      const Value value = i % 4 == 0   ? Value(int64_t{5})
+                          : i % 4 == 1 ? Value(std::string("caf\xc3"))
+                          : i % 4 == 2 ? Value(Dictionary{{"n", Value(-3)}})
+                                       : Value(Bytes{1, 2});
+      dictionary.set("key" + std::to_string(i), value);
+    }
+    for (const CborDialect dialect : {CborDialect::Wire, CborDialect::Typed}) {
+      Bytes pieces;
+      appendCborMapHead(pieces, dictionary.size());
+      for (const auto& [key, value] : dictionary) appendCborEntry(pieces, key, value, dialect);
+      EXPECT_EQ(toHex(pieces), toHex(encodeCbor(Value(dictionary), dialect))) << count << " entries";
+    }
+  }
+}
+
 TEST(CborDecoding, AcceptsLongerHeadsThanNecessary) {
   EXPECT_TRUE(Value::identical(decodedOrDie("1b0000000000000005"), Value(uint64_t{5})));
   EXPECT_TRUE(Value::identical(decodedOrDie("79000161"), Value("a")));

@@ -8,6 +8,7 @@
 
 #include "platform/log/CaptureSink.h"
 #include "platform/sandbox/Extensions.h"
+#include "platform/value/Cbor.h"
 #include "tests/tenond/database/DatabaseTestSupport.h"
 
 namespace tnd::test {
@@ -163,6 +164,60 @@ TEST_F(DaemonPlugIn, ResourcesOutsideTheBundleGetNoTokenAndAreLogged) {
                                   "refusing extension for resource " + resource + " of plug-in at " + shared))
         << resource;
   }
+}
+
+// The form a lookup answers with, built the plain way: the exported form
+// (empty when it fails), the annotation, the sandbox extensions.
+tn::Bytes plainEncodedForm(const TNDPlugIn& plugIn, const Dictionary& annotations) {
+  tn::Result<Dictionary> exported = plugIn.exportForm();
+  Dictionary form = exported.ok() ? *exported : Dictionary();
+  form.set("annotations", Value(annotations));
+  plugIn.augmentForm(form);
+  return tn::encodeCbor(Value(form), tn::CborDialect::Typed);
+}
+
+size_t linesContaining(const tn::log::CaptureSink& capture, const std::string& text) {
+  size_t lines = 0;
+  for (const auto& line : capture.records()) lines += line.text.find(text) != std::string::npos ? 1 : 0;
+  return lines;
+}
+
+TEST_F(DaemonPlugIn, TheKeptEncodedFormIsByteForByteThePlainOne) {
+  const std::string shared = root_.makeAppWithPlugIn("Shares", "com.example.shares",
+                                                     R"(, "Shared": ["Resources", "Missing"])");
+  tn::test::makeDirectory(shared + "/Resources");
+  const std::string data = root_.makeAppWithPlugIn("Data", "com.example.data", R"(, "Shared": ".")", "#Data");
+  const std::string plain = root_.makeAppWithPlugIn("Plain", "com.example.plain");
+  open();
+  const Dictionary annotations{{"election", Value(int64_t{1})}, {"note", Value("caf\xc3")}};
+  tn::log::ScopedCaptureSink capture;
+  for (const std::string& bundle : {shared, data, plain}) {
+    const auto plugIn = buildAt(bundle);
+    ASSERT_TRUE(plugIn) << bundle;
+    for (const Dictionary& annotation : {Dictionary(), annotations}) {
+      const Value encoded = plugIn->encodedForm(annotation);
+      ASSERT_TRUE(encoded.data()) << bundle;
+      EXPECT_EQ(*encoded.data(), plainEncodedForm(*plugIn, annotation)) << bundle;
+    }
+  }
+  // A resource without a token is tried again (and logged) on every use:
+  // only complete extensions are kept. Four uses above, one more here.
+  const auto plugIn = buildAt(shared);
+  (void)plugIn->encodedForm({});
+  EXPECT_EQ(linesContaining(capture.sink(), "failed to make extension for Missing"), 5u);
+
+  // Another plug-in arrives: new knowledge, the same form.
+  root_.makeAppWithPlugIn("Other", "com.example.other");
+  ASSERT_TRUE(registrar_->scan().ok());
+  EXPECT_EQ(*plugIn->encodedForm({}).data(), plainEncodedForm(*plugIn, {}));
+
+  // The plug-in goes away: no form to export, the annotation and the
+  // extensions still travel, and the failure is logged on each use.
+  std::filesystem::remove_all(root_.appRoot() + "/Shares");
+  ASSERT_TRUE(registrar_->scan().ok());
+  registrar_->waitForObservers();
+  EXPECT_EQ(*plugIn->encodedForm(annotations).data(), plainEncodedForm(*plugIn, annotations));
+  EXPECT_TRUE(capture->contains("ops", tn::log::Level::Error, "failed to export matching plug-in"));
 }
 
 TEST_F(DaemonPlugIn, TheInformationDictionaryFollowsTheRegistrarsKnowledge) {

@@ -1,0 +1,196 @@
+// The forms a daemon plug-in record answers with: the exported form kept per
+// registrar knowledge, the sandbox extensions that complete it, and its
+// typed encoding kept in two pieces around the one per-request entry, the
+// user's annotation (see "Forms" in TNDPlugIn.h).
+
+#include <cstring>
+
+#include "libtenon/model/PlugInKeys.h"
+#include "libtenon/model/TNSandboxExtension.h"
+#include "platform/log/Log.h"
+#include "platform/value/Cbor.h"
+#include "tenond/plugin/TNDPlugIn.h"
+
+namespace tnd {
+namespace {
+
+constexpr std::string_view kSharedKey = "Shared";
+constexpr std::string_view kBundleIdentifierKey = "BNBundleIdentifier";
+
+// The system's text for an errno-coded sandbox failure.
+std::string failureText(const tn::Error& error) {
+  const char* text = strerrordesc_np(static_cast<int>(error.code()));
+  return text ? text : error.localizedDescription();
+}
+
+}  // namespace
+
+// What a record keeps of its form for one knowledge generation: only
+// encoded bytes and the tokens, which cost a tenth of the memory the form's
+// dictionary would (ten thousand records are kept).
+struct TNDPlugIn::KeptForm {
+  std::optional<tn::UUID> knowledge;
+  std::optional<tn::Error> exportError;  // why the form could not be exported
+  // Kept only when complete; otherwise made again on every use.
+  std::optional<tn::Dictionary> augmentation;
+  // The encoded entries before "annotations", and those after it followed
+  // by the augmentation's (only when the augmentation is kept), in one
+  // buffer: before = [0, split), after = [split, end).
+  tn::Bytes encoded;
+  std::size_t split = 0;
+  std::size_t beforeCount = 0;
+  std::size_t afterCount = 0;
+};
+
+tn::Dictionary TNDPlugIn::issueResourceExtensions(const tn::Value& resources) const {
+  bool complete = true;
+  return issueResourceExtensions(resources, complete);
+}
+
+tn::Dictionary TNDPlugIn::issueResourceExtensions(const tn::Value& resources, bool& complete) const {
+  tn::Array list;
+  if (resources.isString()) {
+    list.push_back(resources);
+  } else if (const tn::Array* array = resources.array()) {
+    list = *array;
+  }
+  tn::Dictionary tokens;
+  const std::optional<tn::URL> bundle = url();
+  if (!bundle) return tokens;
+  for (const tn::Value& element : list) {
+    const std::string* resource = element.string();
+    if (resource == nullptr) continue;
+    tn::Result<std::string> token = issueResourceExtension(*bundle, *resource);
+    if (!token.ok()) complete = false;
+    if (!token.ok() && token.error().code() == EPERM) {
+      TN_LOG_INFO(tn::log::ops(), "refusing extension for resource {} of plug-in at {}: {}", *resource,
+                  bundle->path(), token.error().localizedDescription());
+      continue;
+    }
+    if (!token.ok()) {
+      TN_LOG_INFO(tn::log::ops(), "failed to make extension for {} in plug-in at {}: {}", *resource,
+                  bundle->path(), failureText(token.error()));
+      continue;
+    }
+    tokens.set(*resource, tn::Value(*token));
+  }
+  return tokens;
+}
+
+tn::Result<std::string> TNDPlugIn::issueResourceExtension(const tn::URL& bundle, const std::string& resource) const {
+  {
+    std::lock_guard lock(resourcePathsMutex_);
+    if (const auto known = resourcePaths_.find(resource); known != resourcePaths_.end()) {
+      return tn::issueCheckedResourceExtension(known->second);
+    }
+  }
+  tn::Result<std::string> path = tn::bundleResourcePath(bundle.path(), resource);
+  if (!path) return path.error();
+  {
+    std::lock_guard lock(resourcePathsMutex_);
+    resourcePaths_.emplace(resource, *path);
+  }
+  return tn::issueCheckedResourceExtension(*path);
+}
+
+TNDPlugIn::Augmentation TNDPlugIn::augmentation() const {
+  Augmentation made;
+  tn::Value resources = pluginKey(kSharedKey);
+  if (isAppExtension()) resources = tn::Value(tn::Array{tn::Value(".")});
+  if (!resources.isNull()) made.entries.set("extensions", tn::Value(issueResourceExtensions(resources, made.complete)));
+  if (isData()) return made;
+  const tn::Value bundleIdentifier = infoKey(kBundleIdentifierKey);
+  const std::string name = bundleIdentifier.string() ? *bundleIdentifier.string() : std::string();
+  tn::Result<std::string> token = tn::issueServiceExtension(name);
+  if (token.ok()) {
+    made.entries.set("service-extension", tn::Value(*token));
+  } else {
+    made.complete = false;
+    TN_LOG_INFO(tn::log::ops(), "failed to make mach extension for {} in plug-in at {}: {}", name,
+                path().value_or(""), failureText(token.error()));
+  }
+  return made;
+}
+
+TNDPlugIn::CurrentForm TNDPlugIn::makeKeptForm(const std::optional<tn::UUID>& knowledge) const {
+  auto kept = std::make_shared<KeptForm>();
+  kept->knowledge = knowledge;
+  tn::Result<tn::Dictionary> exported = exportForm();
+  if (!exported.ok()) {
+    kept->exportError = exported.error();
+    exported = tn::Dictionary();
+  }
+  CurrentForm current;
+  Augmentation augmented = augmentation();
+  if (augmented.complete) {
+    kept->augmentation = std::move(augmented.entries);
+  } else {
+    current.augmentation = std::move(augmented);
+  }
+  tn::Bytes before;
+  tn::Bytes& after = kept->encoded;
+  bool afterAnnotations = false;
+  for (const auto& [key, value] : *exported) {
+    if (key == tn::formkeys::kAnnotations) {
+      afterAnnotations = true;
+      continue;
+    }
+    tn::appendCborEntry(afterAnnotations ? after : before, key, value, tn::CborDialect::Typed);
+    ++(afterAnnotations ? kept->afterCount : kept->beforeCount);
+  }
+  if (kept->augmentation) {
+    for (const auto& [key, value] : *kept->augmentation) {
+      tn::appendCborEntry(after, key, value, tn::CborDialect::Typed);
+      ++kept->afterCount;
+    }
+  }
+  kept->split = before.size();
+  after.insert(after.begin(), before.begin(), before.end());
+  after.shrink_to_fit();
+  current.kept = std::move(kept);
+  return current;
+}
+
+TNDPlugIn::CurrentForm TNDPlugIn::currentForm() const {
+  (void)bundleInfoDictionary();  // follows the registrar's knowledge first
+  const std::optional<tn::UUID> knowledge = rgKnowledgeUUID();
+  {
+    const std::lock_guard lock(keptFormMutex_);
+    if (keptForm_ && keptForm_->knowledge == knowledge) return CurrentForm{keptForm_, std::nullopt};
+  }
+  CurrentForm made = makeKeptForm(knowledge);
+  const std::lock_guard lock(keptFormMutex_);
+  keptForm_ = made.kept;
+  return made;
+}
+
+tn::Dictionary TNDPlugIn::CurrentForm::augmentationEntries(const TNDPlugIn& plugIn) const {
+  if (kept->augmentation) return *kept->augmentation;
+  return augmentation ? augmentation->entries : plugIn.augmentation().entries;
+}
+
+void TNDPlugIn::augmentForm(tn::Dictionary& form) const {
+  for (const auto& [key, value] : currentForm().augmentationEntries(*this)) form.set(key, value);
+}
+
+tn::Value TNDPlugIn::encodedForm(const tn::Dictionary& annotations) const {
+  const CurrentForm current = currentForm();
+  const KeptForm* kept = current.kept.get();
+  if (kept->exportError) {
+    TN_LOG_ERROR(tn::log::ops(), "failed to export matching plug-in {}: {}", uuidText(),
+                 kept->exportError->description());
+  }
+  // The extensions when they are not part of the kept encoding.
+  const tn::Dictionary late = kept->augmentation ? tn::Dictionary() : current.augmentationEntries(*this);
+  const auto split = kept->encoded.begin() + static_cast<std::ptrdiff_t>(kept->split);
+  tn::Bytes encoded;
+  encoded.reserve(kept->encoded.size() + 256);
+  tn::appendCborMapHead(encoded, kept->beforeCount + 1 + kept->afterCount + late.size());
+  encoded.insert(encoded.end(), kept->encoded.begin(), split);
+  tn::appendCborEntry(encoded, tn::formkeys::kAnnotations, tn::Value(annotations), tn::CborDialect::Typed);
+  encoded.insert(encoded.end(), split, kept->encoded.end());
+  for (const auto& [key, value] : late) tn::appendCborEntry(encoded, key, value, tn::CborDialect::Typed);
+  return tn::Value(std::move(encoded));
+}
+
+}  // namespace tnd

@@ -86,12 +86,14 @@ void appendCbor(Bytes& out, const Value& value, CborDialect dialect = CborDialec
 // The CBOR encoding of value, as appendCbor writes it.
 Bytes encodeCbor(const Value& value, CborDialect dialect = CborDialect::Wire);
 
-// A map encoded piece by piece, for callers that keep the encoding of some
+// A map (or an array) encoded piece by piece, for callers that keep the encoding of some
 // entries and add others per use: the head of a map of `count` entries,
 // then each entry as appendCborEntry writes it. The result is byte for byte
 // appendCbor's encoding of the dictionary holding those entries in that
 // order (keys are expected to be distinct and UTF-8).
 void appendCborMapHead(Bytes& out, uint64_t count);
+// The same for an array: its head, then each element's appendCbor.
+void appendCborArrayHead(Bytes& out, uint64_t count);
 void appendCborEntry(Bytes& out, std::string_view key, const Value& value, CborDialect dialect = CborDialect::Wire);
 
 // Decodes exactly one CBOR item of any kind, which must fill the input.

@@ -92,6 +92,7 @@ class Writer {
   const uint8_t* cursor() const { return cursor_; }
 
   void writeMapHead(uint64_t count) { writeHead(kMap, count); }
+  void writeArrayHead(uint64_t count) { writeHead(kArray, count); }
 
   void write(const Value& value) {
     switch (value.kind()) {
@@ -207,6 +208,12 @@ void appendCborMapHead(Bytes& out, uint64_t count) {
   const size_t start = out.size();
   out.resize(start + headSize(count));
   Writer(out.data() + start, CborDialect::Wire).writeMapHead(count);
+}
+
+void appendCborArrayHead(Bytes& out, uint64_t count) {
+  const size_t start = out.size();
+  out.resize(start + headSize(count));
+  Writer(out.data() + start, CborDialect::Wire).writeArrayHead(count);
 }
 
 void appendCborEntry(Bytes& out, std::string_view key, const Value& value, CborDialect dialect) {

@@ -101,11 +101,17 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   // of an application extension) and "service-extension" (a service-lookup
   // extension for the bundle identifier, unless a data plug-in) to a form.
   void augmentForm(tn::Dictionary& form) const;
+  // Why exportForm() fails for the record as the registrar knows it now,
+  // or none.
+  std::optional<tn::Error> exportError() const;
   // The typed encoding (tn::encodeTyped) of the form a lookup answers with:
   // the exported form, or an empty one when the plug-in cannot be exported
   // (logged as an error on "ops"), with "annotations" set to `annotations`,
-  // then augmented. Byte for byte what encoding that dictionary would give.
-  tn::Value encodedForm(const tn::Dictionary& annotations) const;
+  // then augmented, then `extra`'s entries added. Byte for byte what
+  // encoding that dictionary would give. appendEncodedForm appends those
+  // bytes (a discovery's array of forms).
+  tn::Value encodedForm(const tn::Dictionary& annotations, const tn::Dictionary& extra = {}) const;
+  void appendEncodedForm(tn::Bytes& out, const tn::Dictionary& annotations, const tn::Dictionary& extra = {}) const;
   // Resource (relative path, "." for the bundle) to its file extension
   // token; resources whose extension fails are logged and left out. A
   // resource that is absolute, has a ".." component or resolves outside the

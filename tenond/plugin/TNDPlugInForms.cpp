@@ -173,7 +173,16 @@ void TNDPlugIn::augmentForm(tn::Dictionary& form) const {
   for (const auto& [key, value] : currentForm().augmentationEntries(*this)) form.set(key, value);
 }
 
-tn::Value TNDPlugIn::encodedForm(const tn::Dictionary& annotations) const {
+std::optional<tn::Error> TNDPlugIn::exportError() const { return currentForm().kept->exportError; }
+
+tn::Value TNDPlugIn::encodedForm(const tn::Dictionary& annotations, const tn::Dictionary& extra) const {
+  tn::Bytes encoded;
+  appendEncodedForm(encoded, annotations, extra);
+  return tn::Value(std::move(encoded));
+}
+
+void TNDPlugIn::appendEncodedForm(tn::Bytes& out, const tn::Dictionary& annotations,
+                                  const tn::Dictionary& extra) const {
   const CurrentForm current = currentForm();
   const KeptForm* kept = current.kept.get();
   if (kept->exportError) {
@@ -183,14 +192,13 @@ tn::Value TNDPlugIn::encodedForm(const tn::Dictionary& annotations) const {
   // The extensions when they are not part of the kept encoding.
   const tn::Dictionary late = kept->augmentation ? tn::Dictionary() : current.augmentationEntries(*this);
   const auto split = kept->encoded.begin() + static_cast<std::ptrdiff_t>(kept->split);
-  tn::Bytes encoded;
-  encoded.reserve(kept->encoded.size() + 256);
-  tn::appendCborMapHead(encoded, kept->beforeCount + 1 + kept->afterCount + late.size());
-  encoded.insert(encoded.end(), kept->encoded.begin(), split);
-  tn::appendCborEntry(encoded, tn::formkeys::kAnnotations, tn::Value(annotations), tn::CborDialect::Typed);
-  encoded.insert(encoded.end(), split, kept->encoded.end());
-  for (const auto& [key, value] : late) tn::appendCborEntry(encoded, key, value, tn::CborDialect::Typed);
-  return tn::Value(std::move(encoded));
+  out.reserve(out.size() + kept->encoded.size() + 256);
+  tn::appendCborMapHead(out, kept->beforeCount + 1 + kept->afterCount + late.size() + extra.size());
+  out.insert(out.end(), kept->encoded.begin(), split);
+  tn::appendCborEntry(out, tn::formkeys::kAnnotations, tn::Value(annotations), tn::CborDialect::Typed);
+  out.insert(out.end(), split, kept->encoded.end());
+  for (const auto& [key, value] : late) tn::appendCborEntry(out, key, value, tn::CborDialect::Typed);
+  for (const auto& [key, value] : extra) tn::appendCborEntry(out, key, value, tn::CborDialect::Typed);
 }
 
 }  // namespace tnd

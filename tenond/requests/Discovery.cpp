@@ -25,6 +25,18 @@ std::optional<std::string> versionText(const tn::Value& version) {
   return std::nullopt;
 }
 
+// The version a plug-in's form carries.
+tn::Value formVersion(const TNDPlugIn& plugIn) {
+  const tn::Value version = plugIn.version();
+  return version.isNull() ? tn::Value(formkeys::kNoVersion) : version;
+}
+
+// The UUID a plug-in's form carries.
+tn::Value formUUID(const TNDPlugIn& plugIn) {
+  const std::optional<tn::UUID> uuid = plugIn.uuid();
+  return uuid ? tn::Value(uuid->string()) : tn::Value();
+}
+
 }  // namespace
 
 Discovery::Discovery(Request request)
@@ -33,7 +45,7 @@ Discovery::Discovery(Request request)
       rules_(std::move(request.rules)),
       flags_(request.flags),
       exclusions_(std::move(request.exclusions)),
-      addAnnotation_(std::move(request.addAnnotation)),
+      annotation_(std::move(request.annotation)),
       log_(request.log),
       context_(TNDMatchContext::current()),
       held_(server_->heldPlugIns(request.user)) {
@@ -183,7 +195,7 @@ std::optional<StepVerdict> Discovery::firstRefusal(const TNDPlugIn& plugIn) cons
   return std::nullopt;
 }
 
-tn::Array Discovery::run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trace) {
+std::vector<Discovery::Offer> Discovery::run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trace) {
   std::vector<Result> results;
   // Where the results of each identifier are, so that duplicate reduction
   // looks only at those (a registry of thousands must not cost a square).
@@ -194,36 +206,29 @@ tn::Array Discovery::run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trac
       if (traced) trace->verdicts.push_back(std::move(*refusal));
       continue;
     }
-    tn::Result<tn::Dictionary> form = candidate->exportForm();
-    if (!form.ok()) {
+    if (const std::optional<tn::Error> unexported = candidate->exportError()) {
       if (log_) {
         TN_LOG_ERROR(tn::log::ops(), "failed to export matching plug-in {}: {}", candidate->uuidText(),
-                     form.error().description());
+                     unexported->description());
       }
-      if (traced) trace->verdicts.push_back(refuse("export", form.error().localizedDescription()));
+      if (traced) trace->verdicts.push_back(refuse("export", unexported->localizedDescription()));
       continue;
     }
     std::optional<std::string> identifier = candidate->identifier();
     std::vector<std::size_t>& sameIdentifier = byIdentifier[identifier];
     if (!reduceDuplicates(*candidate, results, sameIdentifier, trace)) continue;
     sameIdentifier.push_back(results.size());
-    results.push_back(Result{candidate, std::move(identifier), completedForm(*candidate, std::move(*form))});
+    results.push_back(Result{Offer{candidate, annotation_(*candidate), {}}, std::move(identifier)});
   }
   markReplacements(results, trace);
-  tn::Array forms;
-  forms.reserve(results.size());
+  std::vector<Offer> offers;
+  offers.reserve(results.size());
   for (Result& result : results) {
     if (result.dropped) continue;
-    if (trace && result.plugIn->uuid() == trace->subject) trace->offered = true;
-    forms.emplace_back(std::move(result.form));
+    if (trace && result.offer.plugIn->uuid() == trace->subject) trace->offered = true;
+    offers.push_back(std::move(result.offer));
   }
-  return forms;
-}
-
-tn::Dictionary Discovery::completedForm(const TNDPlugIn& plugIn, tn::Dictionary form) const {
-  addAnnotation_(plugIn, form);
-  plugIn.augmentForm(form);
-  return form;
+  return offers;
 }
 
 bool Discovery::reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& results,
@@ -235,15 +240,16 @@ bool Discovery::reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& r
   for (const std::size_t position : sameIdentifier) {
     Result& earlier = results[position];
     if (earlier.dropped) continue;
-    const std::optional<std::string> theirs = versionText(earlier.form.get(formkeys::kVersion));
+    const TNDPlugIn& earlierPlugIn = *earlier.offer.plugIn;
+    const std::optional<std::string> theirs = versionText(formVersion(earlierPlugIn));
     const int order = mine && theirs ? tn::compareVersionString(*mine, *theirs) : 0;
     if (order != 0 && allVersions) continue;  // another version: both stay
-    const bool wins = order > 0 || (order == 0 && preferredOver(plugIn, earlier.form));
-    const std::string other = earlier.plugIn->uuidText();
+    const bool wins = order > 0 || (order == 0 && preferredOver(plugIn, earlierPlugIn));
+    const std::string other = earlierPlugIn.uuidText();
     if (traced) {
       trace->verdicts.push_back(wins ? pass("duplicates", "preferred to " + other + ", which it replaces")
                                      : refuse("duplicates", "another copy is preferred: " + other));
-    } else if (trace && earlier.plugIn->uuid() == trace->subject && wins) {
+    } else if (trace && earlierPlugIn.uuid() == trace->subject && wins) {
       trace->verdicts.push_back(refuse("duplicates", "another copy is preferred: " + plugIn.uuidText()));
     }
     if (!wins) return false;
@@ -254,12 +260,10 @@ bool Discovery::reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& r
   return true;
 }
 
-bool Discovery::preferredOver(const TNDPlugIn& plugIn, const tn::Dictionary& form) const {
-  const bool theirsOnSystem = form.get(formkeys::kSystemResident) == tn::Value(true);
-  if (!plugIn.onSystemVolume() && theirsOnSystem) return false;
-  if (plugIn.onSystemVolume() && !theirsOnSystem) return true;
-  const std::optional<int64_t> theirs = form.get(formkeys::kLastModified).int64();
-  return plugIn.lastModified() > theirs.value_or(0);
+bool Discovery::preferredOver(const TNDPlugIn& plugIn, const TNDPlugIn& theirs) const {
+  if (!plugIn.onSystemVolume() && theirs.onSystemVolume()) return false;
+  if (plugIn.onSystemVolume() && !theirs.onSystemVolume()) return true;
+  return plugIn.lastModified() > theirs.lastModified();
 }
 
 void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* trace) const {
@@ -268,7 +272,7 @@ void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* t
   std::unordered_map<std::string, Result*> replacements;
   for (Result& result : results) {
     if (result.dropped) continue;
-    const tn::Value declared = result.plugIn->valueForEntitlement(TNDPlugIn::kReplacePlugInEntitlement);
+    const tn::Value declared = result.offer.plugIn->valueForEntitlement(TNDPlugIn::kReplacePlugInEntitlement);
     if (const std::string* one = declared.string()) replacements[*one] = &result;
     if (const tn::Array* many = declared.array()) {
       for (const tn::Value& element : *many) {
@@ -283,17 +287,18 @@ void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* t
     const auto found = identifier ? replacements.find(*identifier) : replacements.end();
     if (found == replacements.end()) continue;
     Result& overrider = *found->second;
-    const tn::Value overriderUUID = overrider.form.get(formkeys::kUUID);
-    result.form.set("overrider", overriderUUID);
-    overrider.form.set("overriding", tn::Value(*identifier));
+    const tn::Value overriderUUID = formUUID(*overrider.offer.plugIn);
+    result.offer.marks.set("overrider", overriderUUID);
+    overrider.offer.marks.set("overriding", tn::Value(*identifier));
     if (log_) {
       TN_LOG_INFO(tn::log::ops(), "plug-in {} overrides {}", overriderUUID.description(),
-                  result.form.get(formkeys::kUUID).description());
+                  formUUID(*result.offer.plugIn).description());
     }
-    if (trace && result.plugIn->uuid() == trace->subject) {
-      trace->verdicts.push_back(pass("replacement", "replaced by " + overrider.plugIn->uuidText() + " (overrider)"));
+    if (trace && result.offer.plugIn->uuid() == trace->subject) {
+      trace->verdicts.push_back(
+          pass("replacement", "replaced by " + overrider.offer.plugIn->uuidText() + " (overrider)"));
     }
-    if (trace && overrider.plugIn->uuid() == trace->subject) {
+    if (trace && overrider.offer.plugIn->uuid() == trace->subject) {
       trace->verdicts.push_back(pass("replacement", "replaces " + *identifier + " (overriding)"));
     }
   }

@@ -69,8 +69,8 @@ class Discovery {
     tn::Value rules;       // a dictionary, or null
     uint64_t flags = 0;
     tn::Value exclusions;  // an array of rules dictionaries, or null
-    // Puts the user's annotation into a form (Transaction::addAnnotationForPlugIn).
-    std::function<void(const TNDPlugIn&, tn::Dictionary&)> addAnnotation;
+    // The user's annotation as a form carries it (Transaction::annotationForForm).
+    std::function<tn::Dictionary(const TNDPlugIn&)> annotation;
     bool log = true;       // the run's log lines ("explain" runs quietly)
     uid_t user = 0;        // the requesting client's user: the holds that reach it apply
   };
@@ -93,20 +93,26 @@ class Discovery {
   // Every step for one plug-in, none skipped (what "explain" shows first).
   std::vector<StepVerdict> allSteps(const TNDPlugIn& plugIn) const;
 
-  // The whole discovery over the candidates: the forms of the plug-ins the
-  // host gets, in the order they were accepted, each with its annotation,
-  // its sandbox extensions and its replacement marks. With a trace, what
-  // happened to trace->subject on the way is recorded (and nothing else
-  // changes).
-  tn::Array run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trace = nullptr);
+  // One plug-in the host gets: its form is the record's (TNDPlugIn::
+  // encodedForm) with this annotation, then these replacement marks
+  // ("overrider", "overriding", in the order they were made).
+  struct Offer {
+    PlugInPtr plugIn;
+    tn::Dictionary annotation;
+    tn::Dictionary marks;
+  };
+
+  // The whole discovery over the candidates: the plug-ins the host gets, in
+  // the order they were accepted. With a trace, what happened to
+  // trace->subject on the way is recorded (and nothing else changes).
+  std::vector<Offer> run(std::vector<PlugInPtr> candidates, DiscoveryTrace* trace = nullptr);
 
   uint64_t flags() const { return flags_; }
 
  private:
   struct Result {
-    PlugInPtr plugIn;
+    Offer offer;
     std::optional<std::string> identifier;
-    tn::Dictionary form;
     bool dropped = false;  // a later duplicate took its place
   };
   struct IdentifierHash {
@@ -123,9 +129,8 @@ class Discovery {
   // when the candidate is dropped; may drop one earlier result.
   bool reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& results,
                         const std::vector<std::size_t>& sameIdentifier, DiscoveryTrace* trace) const;
-  bool preferredOver(const TNDPlugIn& plugIn, const tn::Dictionary& form) const;
+  bool preferredOver(const TNDPlugIn& plugIn, const TNDPlugIn& theirs) const;
   void markReplacements(std::vector<Result>& results, DiscoveryTrace* trace) const;
-  tn::Dictionary completedForm(const TNDPlugIn& plugIn, tn::Dictionary form) const;
   bool discoverAll() const { return (flags_ & kDiscoverAll) != 0; }
   int32_t hostPid() const { return host_->pid(); }
 
@@ -134,7 +139,7 @@ class Discovery {
   const tn::Value rules_;
   const uint64_t flags_;
   const tn::Value exclusions_;
-  const std::function<void(const TNDPlugIn&, tn::Dictionary&)> addAnnotation_;
+  const std::function<tn::Dictionary(const TNDPlugIn&)> annotation_;
   const bool log_;
   const TNDMatchContext context_;
   std::unordered_set<tn::UUID> held_;  // plug-ins blocked by a hold when the request began

@@ -4,9 +4,9 @@
 
 #include <fmt/format.h>
 
-#include "libtenon/client/TNDaemonClient.h"
 #include "libtenon/model/PlugInKeys.h"
 #include "platform/log/Log.h"
+#include "platform/value/Cbor.h"
 #include "platform/value/MessageValue.h"
 #include "tenond/requests/Discovery.h"
 #include "tenond/requests/ExecutableHost.h"
@@ -26,13 +26,23 @@ std::string describeCandidates(const std::vector<PlugInPtr>& candidates) {
   return text + ")";
 }
 
-std::string describeResults(const tn::Array& forms) {
+std::string describeResults(const std::vector<Discovery::Offer>& offers) {
   std::string text = "(";
-  for (const tn::Value& form : forms) {
+  for (const Discovery::Offer& offer : offers) {
     if (text.size() > 1) text += ", ";
-    text += form[tn::formkeys::kUUID].description();
+    const std::optional<tn::UUID> uuid = offer.plugIn->uuid();
+    text += (uuid ? tn::Value(uuid->string()) : tn::Value()).description();
   }
   return text + ")";
+}
+
+// The typed encoding of the offered plug-ins' forms, an array: each form is
+// spliced from what its record keeps, never built as a dictionary.
+tn::Value encodedForms(const std::vector<Discovery::Offer>& offers) {
+  tn::Bytes encoded;
+  tn::appendCborArrayHead(encoded, offers.size());
+  for (const Discovery::Offer& offer : offers) offer.plugIn->appendEncodedForm(encoded, offer.annotation, offer.marks);
+  return tn::Value(std::move(encoded));
 }
 
 tn::Value verdictValue(const StepVerdict& verdict) {
@@ -66,7 +76,7 @@ Discovery Transaction::makeDiscovery(const DiscoveryInput& input, std::shared_pt
   request.rules = input.rules;
   request.flags = input.flags;
   request.exclusions = server()->userPrefs().exclusions().value_or(tn::Value());
-  request.addAnnotation = [this](const TNDPlugIn& plugIn, tn::Dictionary& form) { addAnnotationForPlugIn(plugIn, form); };
+  request.annotation = [this](const TNDPlugIn& plugIn) { return annotationForForm(plugIn); };
   request.log = log;
   request.user = client_->peerIdentity().auditToken.uid;
   return Discovery(std::move(request));
@@ -84,14 +94,13 @@ void Transaction::matchPlugIns() {
     TN_LOG_INFO(tn::log::ops(), "Candidate plugin count: {}, info: {}", candidates.size(),
                 describeCandidates(candidates));
   }
-  const tn::Array results = discovery.run(std::move(candidates));
+  const std::vector<Discovery::Offer> results = discovery.run(std::move(candidates));
   if (results.empty()) {
     TN_LOG_INFO(tn::log::ops(), "Resulting plugin count: 0");
   } else {
     TN_LOG_INFO(tn::log::ops(), "Resulting plugin count: {}, UUIDs: {}", results.size(), describeResults(results));
   }
-  const tn::Value encoded = tn::TNDaemonClient::convertToRelay(tn::Value(results), version());
-  if (!encoded.isNull()) reply().set("matches", encoded);
+  if (version() == kCurrentProtocolVersion) reply().set("matches", encodedForms(results));
   TN_LOG_DEBUG(tn::log::ops(), "reply marshalled");
   done();
 }

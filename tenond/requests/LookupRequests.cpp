@@ -3,7 +3,6 @@
 // a host needs. And the walk over a request's `uuids` array that the
 // requests acting on listed plug-ins share.
 
-#include "libtenon/client/TNDaemonClient.h"
 #include "platform/log/Log.h"
 #include "platform/value/MessageValue.h"
 #include "tenond/requests/Transaction.h"
@@ -48,10 +47,6 @@ tn::Dictionary Transaction::annotationForForm(const TNDPlugIn& plugIn) {
   std::optional<tn::Dictionary> annotation = server()->annotationForPlugIn(plugIn);
   if (annotation) return std::move(*annotation);
   return pluginShouldBeAutoEnabled(plugIn) ? tn::Dictionary{{"election", tn::Value(1)}} : tn::Dictionary();
-}
-
-void Transaction::addAnnotationForPlugIn(const TNDPlugIn& plugIn, tn::Dictionary& form) {
-  form.set("annotations", tn::Value(annotationForForm(plugIn)));
 }
 
 std::shared_ptr<TNDPlugIn> Transaction::findPlugInByFallbackPath(const tn::UUID& uuid, const tn::Value& path) {

@@ -118,8 +118,6 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   std::shared_ptr<TNDPlugIn> findPlugInByPathURL(const std::string& text);
   // The walk's fallback for an unknown UUID: the plug-in at `path` (logged).
   std::shared_ptr<TNDPlugIn> findPlugInByFallbackPath(const tn::UUID& uuid, const tn::Value& path);
-  // Sets the form's "annotations": the stored annotation, else an empty one.
-  void addAnnotationForPlugIn(const TNDPlugIn& plugIn, tn::Dictionary& form);
   // The "annotations" a form carries: the stored annotation, else an empty
   // one (or an election of 1 for a plug-in enabled automatically).
   tn::Dictionary annotationForForm(const TNDPlugIn& plugIn);

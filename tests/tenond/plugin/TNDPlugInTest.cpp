@@ -167,12 +167,14 @@ TEST_F(DaemonPlugIn, ResourcesOutsideTheBundleGetNoTokenAndAreLogged) {
 }
 
 // The form a lookup answers with, built the plain way: the exported form
-// (empty when it fails), the annotation, the sandbox extensions.
-tn::Bytes plainEncodedForm(const TNDPlugIn& plugIn, const Dictionary& annotations) {
+// (empty when it fails), the annotation, the sandbox extensions, and what a
+// discovery adds (replacement marks).
+tn::Bytes plainEncodedForm(const TNDPlugIn& plugIn, const Dictionary& annotations, const Dictionary& extra = {}) {
   tn::Result<Dictionary> exported = plugIn.exportForm();
   Dictionary form = exported.ok() ? *exported : Dictionary();
   form.set("annotations", Value(annotations));
   plugIn.augmentForm(form);
+  for (const auto& [key, value] : extra) form.set(key, value);
   return tn::encodeCbor(Value(form), tn::CborDialect::Typed);
 }
 
@@ -190,6 +192,7 @@ TEST_F(DaemonPlugIn, TheKeptEncodedFormIsByteForByteThePlainOne) {
   const std::string plain = root_.makeAppWithPlugIn("Plain", "com.example.plain");
   open();
   const Dictionary annotations{{"election", Value(int64_t{1})}, {"note", Value("caf\xc3")}};
+  const Dictionary marks{{"overriding", Value("com.example.old")}, {"overrider", Value("E621E1F8")}};
   tn::log::ScopedCaptureSink capture;
   for (const std::string& bundle : {shared, data, plain}) {
     const auto plugIn = buildAt(bundle);
@@ -199,12 +202,13 @@ TEST_F(DaemonPlugIn, TheKeptEncodedFormIsByteForByteThePlainOne) {
       ASSERT_TRUE(encoded.data()) << bundle;
       EXPECT_EQ(*encoded.data(), plainEncodedForm(*plugIn, annotation)) << bundle;
     }
+    EXPECT_EQ(*plugIn->encodedForm(annotations, marks).data(), plainEncodedForm(*plugIn, annotations, marks));
   }
   // A resource without a token is tried again (and logged) on every use:
-  // only complete extensions are kept. Four uses above, one more here.
+  // only complete extensions are kept. Six uses above, one more here.
   const auto plugIn = buildAt(shared);
   (void)plugIn->encodedForm({});
-  EXPECT_EQ(linesContaining(capture.sink(), "failed to make extension for Missing"), 5u);
+  EXPECT_EQ(linesContaining(capture.sink(), "failed to make extension for Missing"), 7u);
 
   // Another plug-in arrives: new knowledge, the same form.
   root_.makeAppWithPlugIn("Other", "com.example.other");

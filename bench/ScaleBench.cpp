@@ -11,7 +11,8 @@
 //
 //   sequential "find" by UUID   one connection, cycling over every plug-in's
 //                               UUID; median round trip against the median of
-//                               a raw Unix-socket echo of the same frames
+//                               a raw Unix-socket echo of the same frames (in
+//                               alternating blocks)
 //   "find" throughput           the load client (32 connections, 16 requests
 //                               in flight on each) against tenond and against
 //                               the echo
@@ -32,6 +33,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdio>
 #include <cstring>
@@ -176,13 +178,24 @@ void reportMemory(Report& report, const char* when, uint64_t bytes) {
 void measureSequential(Report& report, const std::string& echoPath, const std::vector<Bytes>& frames,
                        const Options& options, pid_t daemon) {
   const std::string path = socketPath();
-  const Percentiles firstLookups = percentiles(timeRoundTrips(path, frames, frames.size(), isFound));
+  const Percentiles firstLookups = percentiles(timeRoundTrips(path, frames, 0, frames.size(), isFound));
   progress(format("every plug-in found once: median %.1f us, p99 %.1f us", firstLookups.median, firstLookups.p99));
   reportMemory(report, "after every plug-in was found", residentBytes(daemon));
 
-  const auto count = static_cast<std::size_t>(options.requests);
-  const Percentiles echo = percentiles(timeRoundTrips(echoPath, frames, count, isEcho));
-  const Percentiles found = percentiles(timeRoundTrips(path, frames, count, isFound));
+  // In alternating blocks, so that whatever else the machine does weighs
+  // on both alike.
+  constexpr std::size_t kBlocks = 10;
+  const std::size_t block = std::max<std::size_t>(1, static_cast<std::size_t>(options.requests) / kBlocks);
+  std::vector<double> echoTimes;
+  std::vector<double> foundTimes;
+  for (std::size_t i = 0; i < kBlocks; ++i) {
+    const std::vector<double> echoBlock = timeRoundTrips(echoPath, frames, i * block, block, isEcho);
+    const std::vector<double> foundBlock = timeRoundTrips(path, frames, i * block, block, isFound);
+    echoTimes.insert(echoTimes.end(), echoBlock.begin(), echoBlock.end());
+    foundTimes.insert(foundTimes.end(), foundBlock.begin(), foundBlock.end());
+  }
+  const Percentiles echo = percentiles(std::move(echoTimes));
+  const Percentiles found = percentiles(std::move(foundTimes));
   progress(format("sequential: echo median %.1f us p99 %.1f us; tenond median %.1f us p99 %.1f us", echo.median,
                   echo.p99, found.median, found.p99));
   const double ratio = found.median / echo.median;
@@ -321,7 +334,26 @@ void measureRunningDaemon(Report& report, const ScaleRoot& root, const ScaleFixt
   measureIdle(report, "after the load", daemon->pid(), options);
 }
 
+// The machine and how busy it is, printed with the figures: they mean
+// little on a machine that is doing something else.
+std::string machine() {
+  std::ifstream cpus("/proc/cpuinfo");
+  std::string line;
+  std::string model = "unknown processor";
+  while (std::getline(cpus, line)) {
+    if (line.rfind("model name", 0) == 0) {
+      model = line.substr(line.find(':') + 2);
+      break;
+    }
+  }
+  std::ifstream loads("/proc/loadavg");
+  double load = 0;
+  loads >> load;
+  return format("%ld x %s, load average %.2f", ::sysconf(_SC_NPROCESSORS_ONLN), model.c_str(), load);
+}
+
 int run(const Options& options) {
+  progress(machine());
   const ScaleRoot root;
   progress("making the fixture in " + root.path());
   const Clock::time_point start = Clock::now();
@@ -332,6 +364,7 @@ int run(const Options& options) {
   measureRunningDaemon(report, root, fixture, options);
   measureRestarts(report, fixture.plugIns, options);
   if (options.socketActivation) measureSocketActivatedIdle(report, root, fixture.plugIns, options);
+  progress(machine());
   return report.print() == 0 ? 0 : 1;
 }
 

@@ -103,7 +103,8 @@ Percentiles percentiles(std::vector<double> micros) {
   return {micros[micros.size() / 2], micros[std::min(micros.size() - 1, micros.size() * 99 / 100)]};
 }
 
-std::vector<double> timeRoundTrips(const std::string& path, std::vector<Bytes> frames, std::size_t count,
+std::vector<double> timeRoundTrips(const std::string& path, std::vector<Bytes> frames, std::size_t first,
+                                   std::size_t count,
                                    const std::function<bool(std::span<const uint8_t>)>& check) {
   FrameClient client(path);
   if (!client.connected()) fail("cannot connect to " + path);
@@ -111,7 +112,7 @@ std::vector<double> timeRoundTrips(const std::string& path, std::vector<Bytes> f
   micros.reserve(count);
   Bytes reply;
   for (std::size_t i = 0; i < count; ++i) {
-    Bytes& frame = frames[i % frames.size()];
+    Bytes& frame = frames[(first + i) % frames.size()];
     const Clock::time_point start = Clock::now();
     if (!client.roundTrip(frame, reply)) fail("round trip " + std::to_string(i) + " to " + path + " failed");
     micros.push_back(std::chrono::duration<double, std::micro>(Clock::now() - start).count());

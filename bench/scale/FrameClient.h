@@ -57,10 +57,11 @@ struct Percentiles {
 Percentiles percentiles(std::vector<double> micros);
 
 // `count` round trips over one connection to `path`, cycling through
-// `frames`, each timed from its send to its whole reply; every reply is
+// `frames` from `first` on, each timed from its send to its whole reply; every reply is
 // checked with `check` after its time is taken (none: not checked). Fails
 // the benchmark on any error.
-std::vector<double> timeRoundTrips(const std::string& path, std::vector<Bytes> frames, std::size_t count,
+std::vector<double> timeRoundTrips(const std::string& path, std::vector<Bytes> frames, std::size_t first,
+                                   std::size_t count,
                                    const std::function<bool(std::span<const uint8_t>)>& check);
 
 }  // namespace tn::bench

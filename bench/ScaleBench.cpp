@@ -96,10 +96,16 @@ std::optional<Options> parseOptions(int argc, char** argv) {
                   : option == "--requests"    ? &options.requests
                   : option == "--load-seconds" ? &options.loadSeconds
                                               : nullptr;
-    if (number == nullptr || i + 1 == argc) return std::nullopt;
+    if (number == nullptr) {
+      std::fprintf(stderr, "scale_bench: unknown option %s\n", option.c_str());
+      return std::nullopt;
+    }
     char* end = nullptr;
-    const long value = std::strtol(argv[++i], &end, 10);
-    if (*end != '\0' || value < 1 || value > 100000) return std::nullopt;
+    const long value = i + 1 == argc ? 0 : std::strtol(argv[++i], &end, 10);
+    if (end == nullptr || *end != '\0' || value < 1 || value > 100000) {
+      std::fprintf(stderr, "scale_bench: %s needs a whole number from 1 to 100000\n", option.c_str());
+      return std::nullopt;
+    }
     *number = static_cast<int>(value);
   }
   return options;

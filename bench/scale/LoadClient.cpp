@@ -71,6 +71,7 @@ class Load {
     uint64_t repliesAtStart = 0;
     bool measuring = false;
     for (Clock::time_point now = start; now < end; now = Clock::now()) {
+      failIfInterrupted();
       if (!measuring && now >= measuredFrom) {
         measuring = true;
         repliesAtStart = replies_;

@@ -30,15 +30,29 @@ struct IdleExit::Signals {
 namespace {
 
 // The watcher the activity handler wakes. The handler is a plain function
-// (relay keeps a pointer to it), so it finds the watcher here.
-std::mutex currentMutex;
-std::weak_ptr<IdleExit::Signals> current;
+// (relay keeps a pointer to it), so it finds the watcher here. Never
+// destroyed: a connection may end on another thread while the process
+// exits.
+struct CurrentWatcher {
+  std::mutex mutex;
+  std::weak_ptr<IdleExit::Signals> signals;
+};
+
+CurrentWatcher& currentWatcher() {
+  static CurrentWatcher* const current = new CurrentWatcher;
+  return *current;
+}
+
+void setCurrentWatcher(std::weak_ptr<IdleExit::Signals> signals) {
+  const std::lock_guard lock(currentWatcher().mutex);
+  currentWatcher().signals = std::move(signals);
+}
 
 void wakeCurrentWatcher() {
   std::shared_ptr<IdleExit::Signals> signals;
   {
-    const std::lock_guard lock(currentMutex);
-    signals = current.lock();
+    const std::lock_guard lock(currentWatcher().mutex);
+    signals = currentWatcher().signals.lock();
   }
   if (signals) signals->raise(&IdleExit::Signals::activity);
 }
@@ -47,10 +61,7 @@ void wakeCurrentWatcher() {
 
 std::unique_ptr<IdleExit> IdleExit::start(milliseconds limit, Actions actions) {
   std::unique_ptr<IdleExit> idleExit(new IdleExit(limit, std::move(actions)));
-  {
-    const std::lock_guard lock(currentMutex);
-    current = idleExit->signals_;
-  }
+  setCurrentWatcher(idleExit->signals_);
   relay::setActivityEndedHandler(wakeCurrentWatcher);
   idleExit->watcher_ = std::thread([raw = idleExit.get()] { raw->watch(); });
   return idleExit;
@@ -60,10 +71,8 @@ IdleExit::IdleExit(milliseconds limit, Actions actions)
     : limit_(limit), actions_(std::move(actions)), signals_(std::make_shared<Signals>()) {}
 
 IdleExit::~IdleExit() {
-  {
-    const std::lock_guard lock(currentMutex);
-    current.reset();
-  }
+  relay::setActivityEndedHandler(nullptr);
+  setCurrentWatcher({});
   signals_->raise(&Signals::stopping);
   if (watcher_.joinable()) watcher_.join();
 }

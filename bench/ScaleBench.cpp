@@ -158,6 +158,19 @@ std::optional<double> untilFound(Clock::time_point start, Bytes frame, milliseco
   return std::nullopt;
 }
 
+// Waits until `pid` has used no processor time for a quarter of a second
+// (at most 30 s): a daemon that answers before it has finished starting
+// (verifying its roots in the background, say) is measured once it has.
+void waitUntilSettled(pid_t pid) {
+  const Clock::time_point limit = Clock::now() + std::chrono::seconds(30);
+  for (uint64_t ticks = cpuTicks(pid);;) {
+    pause(milliseconds(250));
+    const uint64_t now = cpuTicks(pid);
+    if (now == ticks || Clock::now() > limit) return;
+    ticks = now;
+  }
+}
+
 std::unique_ptr<ChildDaemon> startTenond() {
   return std::make_unique<ChildDaemon>(std::vector<std::string>{kTenond, "-S", kService});
 }
@@ -265,10 +278,11 @@ void measureRestarts(Report& report, const std::vector<UUID>& plugIns, const Opt
              "<= 300 ms", typical <= 300);
 }
 
-// utime + stime of `pid` over the quiet period, after a short settle; the
+// utime + stime of `pid` over the quiet period, once it has settled; the
 // threads that woke are printed.
 void measureIdle(Report& report, const std::string& what, pid_t pid, const Options& options) {
-  pause(milliseconds(2000));
+  pause(milliseconds(1000));
+  waitUntilSettled(pid);
   const std::map<std::string, uint64_t> switchesBefore = threadSwitches(pid);
   const uint64_t ticksBefore = cpuTicks(pid);
   progress(format("quiet for %d s: ", options.quietSeconds) + what);
@@ -332,7 +346,8 @@ void measureRunningDaemon(Report& report, const ScaleRoot& root, const ScaleFixt
   const std::optional<double> answered = untilFound(start, frames.front(), milliseconds(30000));
   if (!answered) fail("tenond never answered");
   progress(format("tenond answered %.1f ms after its start", *answered));
-  pause(milliseconds(1000));
+  waitUntilSettled(daemon->pid());
+  progress(format("tenond settled %.1f ms after its start", millisecondsSince(start)));
   reportMemory(report, "after start", residentBytes(daemon->pid()));
   measureSequential(report, echo.path(), frames, options, daemon->pid());
   measureThroughput(report, echo.path(), frames, options);

@@ -41,13 +41,17 @@ void makeRegistry() {
   if (!opened.ok() || (*opened)->installedPlugIns().size() != kPlugIns) std::abort();
 }
 
+// Made after the private root, so destroyed before it: the daemon is
+// stopped before its root is removed, and none outlives the run.
 tn::bench::TenondForBench& daemon() {
-  static tn::bench::TenondForBench* daemon = [] {
+  static const bool registryMade = [] {
     tn::bench::usePrivateRoot();
     makeRegistry();
-    return new tn::bench::TenondForBench("com.ostrel.tenon.bench.discovery");
+    return true;
   }();
-  return *daemon;
+  static tn::bench::TenondForBench daemon("com.ostrel.tenon.bench.discovery");
+  (void)registryMade;
+  return daemon;
 }
 
 tn::Value matchRequest(tn::Dictionary rules) {

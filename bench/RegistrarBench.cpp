@@ -15,22 +15,33 @@
 
 namespace {
 
+// The fixture's directory, removed at exit. A static of its own, made
+// before the fixture's paths: statics are destroyed in the reverse order of
+// their making, so it goes last, after everything that could still use it.
+struct FixtureDirectory {
+  FixtureDirectory() {
+    std::string pattern = (std::filesystem::temp_directory_path() / "tenon-registrar-bench-XXXXXX").string();
+    if (::mkdtemp(pattern.data()) == nullptr) std::abort();
+    path = pattern;
+  }
+  ~FixtureDirectory() {
+    std::error_code ignored;
+    std::filesystem::remove_all(path, ignored);
+  }
+  std::string path;
+};
+
 // A private root with the fixture and a store made by a first scan.
 const registrar::RegistrarPaths& fixture() {
+  static const FixtureDirectory directory;
   static const registrar::RegistrarPaths paths = [] {
-    std::string pattern = (std::filesystem::temp_directory_path() / "tenon-registrar-bench-XXXXXX").string();
-    const std::string root = ::mkdtemp(pattern.data());
-    const std::string command = std::string(TENON_FIXTURE_GENERATOR) + " " + root + " 1000 10";
+    const std::string command = std::string(TENON_FIXTURE_GENERATOR) + " " + directory.path + " 1000 10";
     if (std::system(command.c_str()) != 0) std::abort();
-    registrar::RegistrarPaths made = registrar::RegistrarPaths::forRoot(root);
+    registrar::RegistrarPaths made = registrar::RegistrarPaths::forRoot(directory.path);
     registrar::Registrar::Options options;
     options.watch = false;
     options.locale = "";
     if (!registrar::Registrar::open(made, options).ok()) std::abort();
-    std::atexit([] {
-      std::error_code ignored;
-      std::filesystem::remove_all(fixture().root, ignored);
-    });
     return made;
   }();
   return paths;

@@ -2,6 +2,8 @@
 
 #include <unistd.h>
 
+#include "platform/relay/KeepAlive.h"
+
 namespace relay::detail {
 namespace {
 
@@ -73,10 +75,13 @@ bool ConnectionLimit::refusalWorthLogging(uid_t uid, std::chrono::steady_clock::
 }
 
 void ConnectionLimit::releaseOne(uid_t uid) {
-  const std::lock_guard lock(mutex_);
-  --total_;
-  const auto it = live_.find(uid);
-  if (it != live_.end() && --it->second == 0) live_.erase(it);
+  {
+    const std::lock_guard lock(mutex_);
+    --total_;
+    const auto it = live_.find(uid);
+    if (it != live_.end() && --it->second == 0) live_.erase(it);
+  }
+  activityEnded();  // the listener's connection count is lower: an idle exit looks again
 }
 
 }  // namespace relay::detail

@@ -8,6 +8,7 @@ namespace relay {
 namespace {
 
 std::atomic<uint64_t> count{0};
+std::atomic<void (*)()> activityHandler{nullptr};
 
 }  // namespace
 
@@ -21,8 +22,15 @@ void transactionEnd() {
       std::abort();
     }
   } while (!count.compare_exchange_weak(current, current - 1, std::memory_order_relaxed));
+  activityEnded();
 }
 
 uint64_t keepAliveCount() { return count.load(std::memory_order_relaxed); }
+
+void setActivityEndedHandler(void (*handler)()) { activityHandler.store(handler); }
+
+void activityEnded() {
+  if (void (*const handler)() = activityHandler.load()) handler();
+}
 
 }  // namespace relay

@@ -14,6 +14,7 @@
 
 #include "platform/bundle/Bundle.h"
 #include "platform/log/Log.h"
+#include "platform/relay/KeepAlive.h"
 #include "platform/warden/WardenError.h"
 
 namespace warden {
@@ -150,13 +151,16 @@ tn::Result<void> Warden::addRegistration(const ProcessHandle& host, Registration
 }
 
 void Warden::hostEnded(pid_t pid, uint64_t startTime) {
-  const std::lock_guard lock(mutex_);
-  const auto ended = std::find_if(hosts_.begin(), hosts_.end(),
-                                  [&](const HostRecord& host) { return host.host.sameProcess(pid, startTime); });
-  if (ended == hosts_.end()) return;
-  TN_LOG_INFO(tn::log::ops(), "warden: process {} ended; its {} registrations go with it", pid,
-              ended->registrations.size());
-  hosts_.erase(ended);
+  {
+    const std::lock_guard lock(mutex_);
+    const auto ended = std::find_if(hosts_.begin(), hosts_.end(),
+                                    [&](const HostRecord& host) { return host.host.sameProcess(pid, startTime); });
+    if (ended == hosts_.end()) return;
+    TN_LOG_INFO(tn::log::ops(), "warden: process {} ended; its {} registrations go with it", pid,
+                ended->registrations.size());
+    hosts_.erase(ended);
+  }
+  relay::activityEnded();  // fewer registrations: an idle exit looks again
 }
 
 void Warden::removeExternalService(const std::string& bundleIdentifier, const std::string& version,
@@ -233,6 +237,7 @@ void Warden::instanceEnded(pid_t pid, uint64_t startTime) {
     instances_.erase(found);
   }
   for (const auto& notify : waiting) notify();
+  relay::activityEnded();  // one instance fewer: an idle exit looks again
 }
 
 std::optional<InstanceInfo> Warden::runningInstance(pid_t pid, uint64_t startTime) const {

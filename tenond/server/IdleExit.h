@@ -6,23 +6,29 @@
 // Under socket activation the service manager keeps the listening sockets
 // and starts the daemon again for the next connection, so a daemon with no
 // connection, no hold and no plug-in instance may go and give its memory
-// back. A watcher thread asks `isIdle` a few times per limit; once it has
-// answered true without a break for `limit`, the watcher has the listener
-// stop accepting (`stopAccepting`, on the main queue: new clients now wait
-// in the socket's backlog for the next daemon), then waits until `isIdle`
-// holds again (a client accepted in between is served to its end) and calls
-// `exit` on the main queue. Nothing is ever refused: a client either
-// reaches this daemon or waits for the next one.
+// back. Once `isIdle` has held without a break for `limit`, the watcher has
+// the listener stop accepting (`stopAccepting`, on the main queue: new
+// clients now wait in the socket's backlog for the next daemon), then waits
+// until `isIdle` holds again (a client accepted in between is served to its
+// end) and calls `exit` on the main queue. Nothing is ever refused: a
+// client either reaches this daemon or waits for the next one.
+//
+// The watcher never polls: a daemon with nothing to do must not wake. It
+// sleeps until its deadline or until something that kept the daemon busy
+// ends (relay::activityEnded: a connection of any listener, a hold, a
+// supervisor's host or instance), and asks `isIdle` only then. Idle after
+// an end re-arms the deadline a whole `limit` away; busy at the deadline
+// disarms it until the next end. Work that begins needs no signal: it is
+// either still going at the deadline (seen then) or has ended (an end).
 //
 // Threads: `isIdle` runs on the watcher thread and must be safe there;
-// the other two run on the main queue. Destroying the object stops the
-// watcher (and joins it) if it has not posted `exit` yet.
+// the other two run on the main queue. One IdleExit per process (it owns
+// relay::setActivityEndedHandler). Destroying the object stops the watcher
+// (and joins it) if it has not posted `exit` yet.
 
 #include <chrono>
-#include <condition_variable>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <thread>
 
 namespace tnd {
@@ -42,21 +48,23 @@ class IdleExit {
   IdleExit(const IdleExit&) = delete;
   IdleExit& operator=(const IdleExit&) = delete;
 
-  // How often the watcher asks: a quarter of the limit, between 50 ms and
-  // 5 s, so that the daemon exits at most a quarter late.
-  static std::chrono::milliseconds pollPeriod(std::chrono::milliseconds limit);
+  // What the watcher waits on, shared with the activity handler and the
+  // block that stops the listener (either may outlive the object).
+  struct Signals;
 
  private:
   IdleExit(std::chrono::milliseconds limit, Actions actions);
   void watch();
-  // Waits `period`; false when the object is being destroyed.
-  bool pause(std::chrono::milliseconds period);
+  // Sleeps until `limit_` of unbroken idleness has passed; false when the
+  // object is being destroyed.
+  bool waitForIdleLimit();
+  // Once the listener has stopped, sleeps until the daemon is idle again;
+  // false when the object is being destroyed.
+  bool waitForDrain();
 
   const std::chrono::milliseconds limit_;
   const Actions actions_;
-  std::mutex mutex_;
-  std::condition_variable wake_;
-  bool stopping_ = false;  // guarded by mutex_
+  const std::shared_ptr<Signals> signals_;
   std::thread watcher_;
 };
 

@@ -16,8 +16,9 @@
 // - application roots (RegistrarPaths): every directory directly inside a
 //   root is an application, its plug-ins are the bundles in its
 //   Support/PlugIns (and, nested, in theirs); an application holding a
-//   ".installing" file is an install placeholder. Scanned at open and, when
-//   watching, again whenever inotify reports a change under a root;
+//   ".installing" file is an install placeholder. Scanned at open (a warm
+//   start: in the background, after answering from the store) and, when
+//   watching, the application inotify reported a change in, alone;
 // - plug-in bundles registered one by one by URL (registerPlugIn), kept
 //   until unregistered or gone from disk;
 // - extension points: <root>/usr/share/tenon/extension-points/*.manifest.
@@ -44,7 +45,11 @@
 //   Store.h            the SQLite store
 //   BundleReader.h     reading bundles, fingerprints
 //   QueryNarrowing.h   which plug-ins a rules dictionary certainly excludes
-//   InstallWatcher.h   inotify over the application roots
+//   InstallWatcher.h   inotify over the application roots, changes by application
+//   ChangeScope.h      which applications a set of changed paths touches
+//   Scanner.h          reading the roots into a plan, whole or in part
+//   RegistrarState.h   the in-memory state and a scan's plan
+//   ValueInterner.h    one shared copy of equal values at load
 //   StringsTables.h    localized strings tables, cached
 //   StoredRecords.h    the persisted form of each record
 

@@ -185,5 +185,22 @@ TEST(RegistrarIncremental, ABundleCopiedFileByFileIsReadOnceComplete) {
   EXPECT_EQ(capture->count("rg", tn::log::Level::Error, copied), 0u) << "never read half written";
 }
 
+TEST(RegistrarMemory, RecordsLoadedFromTheStoreShareEqualDictionaries) {
+  PlatformRoot root;
+  const std::string app = root.makeApp(root.appRoot(), "App", "com.example.app");
+  const std::string one = PlatformRoot::makePlugIn(app, "One", "com.example.one");
+  const std::string two = PlatformRoot::makePlugIn(app, "Two", "com.example.two");
+  { root.open(quiet()); }
+  auto registrar = root.open(quiet());
+  const PlugInPtr first = registrar->plugInForURL(tn::URL::fileURLWithPath(one));
+  const PlugInPtr second = registrar->plugInForURL(tn::URL::fileURLWithPath(two));
+  ASSERT_TRUE(first && second);
+  EXPECT_EQ(first->plugInDictionary().dictionary(), second->plugInDictionary().dictionary())
+      << "the same \"XTExtension\" is held once";
+  EXPECT_EQ(first->entitlements().dictionary(), second->entitlements().dictionary());
+  EXPECT_NE(first->infoDictionary().dictionary(), second->infoDictionary().dictionary());
+  EXPECT_EQ(*first->infoDictionary()["BNBundleIdentifier"].string(), "com.example.one");
+}
+
 }  // namespace
 }  // namespace registrar::test

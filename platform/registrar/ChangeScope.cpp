@@ -9,15 +9,28 @@ bool isAtOrBelow(const std::string& path, const std::string& directory) {
                                path[directory.size()] == '/');
 }
 
-// The registered bundle that path names, lies in, or is the parent of an
-// event about; null when none.
-const std::string* registeredBundleOf(const std::string& path, const State& state) {
-  // Registered bundles are few (each one added by hand): a scan is cheap.
-  for (const auto& [bundlePath, plugIn] : state.storedPlugIns) {
-    if (plugIn.registeredByURL && isAtOrBelow(path, bundlePath)) return &bundlePath;
+// The registered bundles and the directories they lie in: few (each one
+// added by hand), gathered once per batch of changes.
+struct Registered {
+  std::set<std::string> bundles;
+  std::set<std::string> parents;
+
+  explicit Registered(const State& state) {
+    for (const auto& [path, plugIn] : state.storedPlugIns) {
+      if (!plugIn.registeredByURL) continue;
+      bundles.insert(path);
+      parents.insert(path.substr(0, path.rfind('/')));
+    }
   }
-  return nullptr;
-}
+
+  // The registered bundle that path names or lies in; null when none.
+  const std::string* bundleOf(const std::string& path) const {
+    for (std::string candidate = path;; candidate.resize(candidate.rfind('/'))) {
+      if (const auto found = bundles.find(candidate); found != bundles.end()) return &*found;
+      if (candidate.rfind('/') == 0 || candidate.rfind('/') == std::string::npos) return nullptr;
+    }
+  }
+};
 
 }  // namespace
 
@@ -40,6 +53,7 @@ void ChangeScope::merge(const ChangeScope& other) {
 ChangeScope ChangeScope::of(const WatchedChanges& changes, const RegistrarPaths& paths, const State& state) {
   ChangeScope scope;
   scope.everything = changes.overflowed;
+  const Registered registered(state);
   for (const std::string& path : changes.paths) {
     if (isAtOrBelow(path, paths.extensionPointsDirectory)) {
       scope.extensionPoints = true;
@@ -60,22 +74,14 @@ ChangeScope ChangeScope::of(const WatchedChanges& changes, const RegistrarPaths&
       break;
     }
     if (inRoot) continue;
-    if (const std::string* bundle = registeredBundleOf(path, state)) {
+    if (const std::string* bundle = registered.bundleOf(path)) {
       scope.registered.insert(*bundle);
       continue;
     }
     // The parent of a registered bundle is watched for the bundle's own
     // removal or renaming; its other entries are nothing to the registry.
     // Any other path is unexpected: look at everything.
-    const std::string parent = path.substr(0, path.rfind('/'));
-    bool parentOfRegistered = false;
-    for (const auto& [bundlePath, plugIn] : state.storedPlugIns) {
-      if (plugIn.registeredByURL && bundlePath.substr(0, bundlePath.rfind('/')) == parent) {
-        parentOfRegistered = true;
-        break;
-      }
-    }
-    if (!parentOfRegistered) scope.everything = true;
+    if (!registered.parents.contains(path.substr(0, path.rfind('/')))) scope.everything = true;
   }
   return scope;
 }

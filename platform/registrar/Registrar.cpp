@@ -509,7 +509,7 @@ tn::Result<void> Registrar::registerPlugIn(const tn::URL& url) {
       }
       return {};
     }
-    Scanner scanner(*current, paths_, nullptr, true);
+    Scanner scanner(*current, paths_, watcher_.get(), true);
     for (const auto& [appPath, app] : current->storedApps) scanner.plan.apps.emplace(appPath, app);
     for (const auto& [plugInPath, plugIn] : current->storedPlugIns) {
       if (plugInPath != path) scanner.plan.plugIns.emplace(plugInPath, plugIn);

@@ -145,6 +145,35 @@ TEST(RegistrarIncremental, AChangeRescansOnlyItsApplication) {
   EXPECT_EQ(full->read, 0u);
 }
 
+TEST(RegistrarIncremental, ARegisteredBundleChangedOrRemovedIsRescannedAlone) {
+  PlatformRoot root;
+  const std::string app = root.makeApp(root.appRoot(), "App", "com.example.app");
+  PlatformRoot::makePlugIn(app, "P", "com.example.p");
+  const std::string loose = root.path() + "/loose/Loose.tnx";
+  PlatformRoot::writePlugIn(loose, "com.example.loose", "1");
+  tn::test::writeFile(root.path() + "/loose/unrelated.txt", "x");
+  Registrar::Options options;
+  options.settle = 0ms;
+  auto registrar = root.open(options);
+  ASSERT_TRUE(registrar->registerPlugIn(tn::URL::fileURLWithPath(loose)).ok());
+  auto observer = std::make_shared<RecordingObserver>(registrar);
+  registrar->addObserver(observer);
+
+  PlatformRoot::writePlugIn(loose, "com.example.loose", "2");
+  waitForBatches(*observer, 2);
+  registrar->waitForObservers();
+  EXPECT_TRUE(registrar->lastScan().incremental);
+  EXPECT_EQ(registrar->lastScan().examined, 1u);
+  EXPECT_EQ(registrar->plugInForURL(tn::URL::fileURLWithPath(loose))->bundleVersion(), "2");
+
+  std::filesystem::rename(loose, root.path() + "/loose/Moved.tnx");
+  waitForBatches(*observer, 3);
+  registrar->waitForObservers();
+  EXPECT_TRUE(registrar->lastScan().incremental);
+  EXPECT_EQ(observer->batches(), (Batches{{"-com.example.loose"}, {"+com.example.loose"}, {"-com.example.loose"}}));
+  EXPECT_EQ(registrar->installedPlugIns().size(), 1u);
+}
+
 TEST(RegistrarIncremental, ABundleCopiedFileByFileIsReadOnceComplete) {
   PlatformRoot root;
   const std::string app = root.makeApp(root.appRoot(), "App", "com.example.app");

@@ -59,6 +59,10 @@ InotifyChannel::Wait InotifyChannel::wait(int timeoutMilliseconds) {
 }
 
 bool InotifyChannel::drain(const EventHandler& each) {
+  return drainWatched([&](int, uint32_t mask, std::string_view name) { each(mask, name); });
+}
+
+bool InotifyChannel::drainWatched(const WatchEventHandler& each) {
   alignas(inotify_event) char buffer[16 * 1024];
   bool readAny = false;
   for (;;) {
@@ -70,7 +74,7 @@ bool InotifyChannel::drain(const EventHandler& each) {
       inotify_event event;
       std::memcpy(&event, buffer + offset, sizeof event);
       const char* name = buffer + offset + sizeof event;
-      each(event.mask, std::string_view(name, event.len > 0 ? ::strnlen(name, event.len) : 0));
+      each(event.wd, event.mask, std::string_view(name, event.len > 0 ? ::strnlen(name, event.len) : 0));
       offset += sizeof event + event.len;
     }
   }

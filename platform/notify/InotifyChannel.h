@@ -49,6 +49,10 @@ class InotifyChannel {
   // True when anything was read.
   using EventHandler = std::function<void(uint32_t mask, std::string_view name)>;
   bool drain(const EventHandler& each);
+  // The same with the watch descriptor each event came from (-1 for a
+  // queue overflow, IN_Q_OVERFLOW), for owners of many watches.
+  using WatchEventHandler = std::function<void(int watch, uint32_t mask, std::string_view name)>;
+  bool drainWatched(const WatchEventHandler& each);
 
   InotifyChannel(CreateTag, int inotify, int wakeup);
 

@@ -15,37 +15,14 @@
 #include "platform/bundle/ManifestFile.h"
 #include "platform/log/Log.h"
 #include "platform/registrar/BundleReader.h"
+#include "platform/registrar/ChangeScope.h"
 #include "platform/registrar/InstallWatcher.h"
 #include "platform/registrar/Locale.h"
 #include "platform/registrar/QueryNarrowing.h"
+#include "platform/registrar/RegistrarState.h"
+#include "platform/registrar/Scanner.h"
 
 namespace registrar {
-
-constexpr std::string_view kManifestSuffix = ".manifest";
-
-// The registry as it stands: stored facts and the records made from them.
-// Immutable once built; a change builds a new State.
-struct State {
-  tn::UUID knowledge;
-  std::string locale;
-  std::vector<std::string> languages;
-  std::map<std::string, StoredApp> storedApps;          // by path
-  std::map<std::string, StoredPlugIn> storedPlugIns;    // by path
-  std::map<std::string, StoredExtensionPoint> storedPoints;  // by identifier
-  std::map<std::string, AppPtr> apps;                   // by path
-  std::map<std::string, PlugInPtr> plugIns;             // by path
-  std::unordered_map<tn::UUID, PlugInPtr> byUUID;
-  std::unordered_multimap<std::string, PlugInPtr> byIdentifierKey;  // equalityKey(identifier)
-  std::map<std::string, ExtensionPointPtr, std::less<>> points;
-};
-
-// What a scan found: the stored facts the registry should hold.
-struct ScanPlan {
-  std::map<std::string, StoredApp> apps;
-  std::map<std::string, StoredPlugIn> plugIns;
-  std::map<std::string, StoredExtensionPoint> points;
-  size_t skipped = 0;
-};
 
 namespace {
 
@@ -160,162 +137,6 @@ StatePtr stateFromContents(Store::Contents contents, const std::string& locale, 
                     paths);
 }
 
-// Reads the roots, registered bundles and extension points into a plan,
-// reusing the stored facts of every bundle whose fingerprint is unchanged.
-class Scanner {
- public:
-  Scanner(const State& current, const RegistrarPaths& paths, InstallWatcher* watcher, bool createContainers)
-      : current_(current), paths_(paths), watcher_(watcher), createContainers_(createContainers) {
-    context_.trust = codesign::TrustSettings::fromEnvironment();
-    context_.stamp = entitlementsStamp(context_.trust);
-  }
-
-  void scanRoots(const Registrar::Progress& progress) {
-    std::vector<std::string> appPaths;
-    for (const std::string& root : paths_.applicationRoots) {
-      if (!isDirectory(root)) continue;
-      watch(root);
-      for (const std::string& name : directoryEntries(root)) appPaths.push_back(root + "/" + name);
-    }
-    for (size_t i = 0; i < appPaths.size(); ++i) {
-      scanApplication(appPaths[i]);
-      if (progress) progress(i + 1, appPaths.size());
-    }
-  }
-
-  void scanApplication(const std::string& path) {
-    const auto existing = current_.storedApps.find(path);
-    std::optional<StoredApp> app;
-    if (existing != current_.storedApps.end() &&
-        existing->second.fingerprint == applicationFingerprint(path, context_)) {
-      app = existing->second;
-    } else {
-      watch(path);  // before reading, so that nothing written meanwhile is missed
-      tn::Result<StoredApp> read = readApplicationBundle(path, context_);
-      if (!read) {
-        skip("application", read.error());
-        return;
-      }
-      app = std::move(*read);
-    }
-    watch(path);
-    watch(bundle::joinPath(path, bundle::kSupportDirectoryName));
-    for (const std::string& plugInPath : plugInBundlePaths(path)) scanPlugIn(plugInPath, path, false);
-    plan.apps.emplace(path, std::move(*app));
-  }
-
-  // The plug-in at path into the plan; false when it was skipped.
-  bool scanPlugIn(const std::string& path, const std::optional<std::string>& appPath, bool registeredByURL) {
-    watch(bundle::joinPath(path, ".."));
-    watch(path);
-    const auto existing = current_.storedPlugIns.find(path);
-    const StoredPlugIn* old = existing != current_.storedPlugIns.end() ? &existing->second : nullptr;
-    if (old != nullptr && old->appPath == appPath && old->registeredByURL == registeredByURL &&
-        old->fingerprint == plugInFingerprint(path, old->info, context_)) {
-      plan.plugIns.emplace(path, *old);
-      return true;
-    }
-    tn::Result<StoredPlugIn> read = readPlugInBundle(path, context_);
-    if (!read) {
-      skip("plug-in", read.error());
-      lastError = read.error();
-      return false;
-    }
-    read->appPath = appPath;
-    read->registeredByURL = registeredByURL;
-    if (old != nullptr && old->sameContents(*read)) {
-      read->uuid = old->uuid;
-      read->registered = old->registered;
-      read->container = old->container;
-    } else {
-      read->uuid = tn::UUID::random();
-      read->registered = tn::Date::now();
-      read->container = dataContainer(*read);
-    }
-    plan.plugIns.emplace(path, std::move(*read));
-    return true;
-  }
-
-  // Registered bundles are re-read from where they were registered; a
-  // bundle an application now provides belongs to the application.
-  void scanRegistered(const std::optional<std::string>& except) {
-    for (const auto& [path, plugIn] : current_.storedPlugIns) {
-      if (!plugIn.registeredByURL || plan.plugIns.contains(path) || except == path) continue;
-      std::string reason;
-      if (!isDirectory(path, &reason)) {
-        TN_LOG_DEFAULT(tn::log::rg(), "registered plug-in {} is gone ({}); unregistering it", path, reason);
-        continue;
-      }
-      scanPlugIn(path, std::nullopt, true);
-    }
-  }
-
-  void scanExtensionPoints() {
-    const std::string& directory = paths_.extensionPointsDirectory;
-    if (!isDirectory(directory)) return;
-    watch(directory);
-    for (const std::string& name : directoryEntries(directory)) {
-      if (!name.ends_with(kManifestSuffix) || name.size() == kManifestSuffix.size()) continue;
-      const std::string identifier = name.substr(0, name.size() - kManifestSuffix.size());
-      const std::string path = directory + "/" + name;
-      const std::string fingerprint = plugInFingerprint(path, tn::Value(), context_);
-      const auto existing = current_.storedPoints.find(identifier);
-      if (existing != current_.storedPoints.end() && existing->second.fingerprint == fingerprint) {
-        plan.points.emplace(identifier, existing->second);
-        continue;
-      }
-      tn::Result<tn::Value> sdk = bundle::readManifestFile(path);
-      if (!sdk || !sdk->isDictionary()) {
-        ++plan.skipped;
-        TN_LOG_ERROR(tn::log::rg(), "skipping extension point {}: {}", path,
-                     sdk ? std::string("not a dictionary") : sdk.error().message().value_or(""));
-        continue;
-      }
-      plan.points.emplace(identifier, StoredExtensionPoint{identifier, path, std::move(*sdk), fingerprint});
-    }
-  }
-
-  ScanPlan plan;
-  std::optional<tn::Error> lastError;
-
- private:
-  void watch(const std::string& path) {
-    if (watcher_ != nullptr) watcher_->watch(path);
-  }
-
-  void skip(std::string_view what, const tn::Error& error) {
-    ++plan.skipped;
-    TN_LOG_ERROR(tn::log::rg(), "skipping {} {}", what, error.message().value_or(error.description()));
-  }
-
-  // $ROOT/var/lib/tenon/containers/<identifier>/ with tmp/, for plug-ins
-  // that are not data plug-ins and whose identifier can name a directory.
-  std::optional<std::string> dataContainer(const StoredPlugIn& plugIn) {
-    const std::string* protocol = plugIn.info[kExtensionKey][kExtensionProtocolKey].string();
-    if (protocol != nullptr && *protocol == kDataProtocol) return std::nullopt;
-    if (!bundle::isPlainFileName(plugIn.identifier)) {
-      TN_LOG_ERROR(tn::log::rg(), "no data container for plug-in {}: identifier \"{}\" cannot name a directory",
-                   plugIn.path, plugIn.identifier);
-      return std::nullopt;
-    }
-    const std::string container = paths_.containersDirectory + "/" + plugIn.identifier;
-    if (!createContainers_) return container;
-    std::error_code error;
-    std::filesystem::create_directories(container + "/tmp", error);
-    if (error) {
-      TN_LOG_ERROR(tn::log::rg(), "cannot create data container {}: {}", container, error.message());
-      return std::nullopt;
-    }
-    return container;
-  }
-
-  const State& current_;
-  const RegistrarPaths& paths_;
-  InstallWatcher* watcher_;
-  bool createContainers_;
-  ReadContext context_;
-};
-
 // A path with a NUL names nothing: the file system would see only the part
 // before it, which may be another bundle.
 bool namesNothing(const std::string& path) { return path.find('\0') != std::string::npos; }
@@ -334,6 +155,9 @@ tn::Result<std::shared_ptr<Registrar>> Registrar::open(const RegistrarPaths& pat
                                                                              : Store::Mode::ReadWrite);
   if (!opened) return opened.error();
   const std::string locale = options.locale.value_or(locale::currentLocale(paths.localeFile));
+  // Held weakly like every observer: the registrar keeps no reference.
+  const std::vector<std::shared_ptr<RegistrarObserver>> observers = std::move(options.observers);
+  options.observers.clear();
   auto registrar = std::make_shared<Registrar>(CreateTag(), paths, options, std::move(opened->store));
   registrar->installState(stateFromContents(std::move(opened->contents), locale, paths));
   TN_LOG_INFO(tn::log::rg(), "opened registrar store {} ({} plug-ins, knowledge {})", paths.storeFile,
@@ -342,10 +166,19 @@ tn::Result<std::shared_ptr<Registrar>> Registrar::open(const RegistrarPaths& pat
   if (options.watch) registrar->startWatching();
   InitialScan initialScan = options.initialScan;
   if (opened->rebuilt && initialScan == InitialScan::None) initialScan = InitialScan::Wait;
+  if (initialScan == InitialScan::Auto) {
+    const StatePtr current = registrar->state();
+    const bool empty = current->storedApps.empty() && current->storedPlugIns.empty() && current->storedPoints.empty();
+    initialScan = empty || opened->rebuilt ? InitialScan::Wait : InitialScan::Background;
+  }
   if (initialScan == InitialScan::Wait) {
-    if (tn::Result<ScanSummary> scanned = registrar->scan(); !scanned) return scanned.error();
-  } else if (initialScan == InitialScan::Background) {
-    registrar->scheduleRescan();
+    if (tn::Result<ScanSummary> scanned = registrar->firstScan(); !scanned) return scanned.error();
+  }
+  for (const std::shared_ptr<RegistrarObserver>& observer : observers) registrar->addObserver(observer);
+  if (initialScan == InitialScan::Background) {
+    ChangeScope everything;
+    everything.everything = true;
+    registrar->scheduleRescan(everything);
   }
   return registrar;
 }
@@ -355,7 +188,8 @@ Registrar::Registrar(CreateTag, RegistrarPaths paths, Options options, std::uniq
       options_(std::move(options)),
       store_(std::move(store)),
       queue_(tn::dispatch::SerialQueue::create("registrar")),
-      observerQueue_(tn::dispatch::SerialQueue::create("registrar-observers")) {}
+      observerQueue_(tn::dispatch::SerialQueue::create("registrar-observers")),
+      pendingScope_(std::make_unique<ChangeScope>()) {}
 
 Registrar::~Registrar() {
   watcher_.reset();
@@ -506,9 +340,15 @@ tn::Result<ScanSummary> Registrar::scanOnQueue(const Progress& progress) {
   for (int attempt = 0;; ++attempt) {
     Scanner scanner(*state(), paths_, watcher_.get(), true);
     scanner.scanRoots(progress);
-    scanner.scanRegistered(std::nullopt);
+    scanner.scanRegistered();
     scanner.scanExtensionPoints();
     tn::Result<ScanSummary> summary = commit(scanner.plan);
+    if (summary) {
+      summary->examined = scanner.examined;
+      summary->read = scanner.read;
+      const std::lock_guard lock(stateMutex_);
+      lastScan_ = *summary;
+    }
     if (summary || summary.error().code() != static_cast<int64_t>(RegistrarErrorCode::StaleKnowledge) ||
         attempt > 0) {
       return summary;
@@ -659,15 +499,17 @@ tn::Result<void> Registrar::registerPlugIn(const tn::URL& url) {
     const bool inRoot = std::any_of(paths_.applicationRoots.begin(), paths_.applicationRoots.end(),
                                     [&](const std::string& root) { return path.starts_with(root + "/"); });
     if (inRoot) {
-      // An application provides it: re-read the roots.
-      tn::Result<ScanSummary> scanned = scanOnQueue({});
+      // An application provides it: re-read that application.
+      WatchedChanges named;
+      named.paths.insert(path);
+      tn::Result<ScanSummary> scanned = rescanOnQueue(ChangeScope::of(named, paths_, *current));
       if (!scanned) return scanned.error();
       if (!state()->plugIns.contains(path)) {
         return registrarError(RegistrarErrorCode::InvalidBundle, fmt::format("{}: no longer a plug-in", path));
       }
       return {};
     }
-    Scanner scanner(*current, paths_, nullptr, true);
+    Scanner scanner(*current, paths_, watcher_.get(), true);
     for (const auto& [appPath, app] : current->storedApps) scanner.plan.apps.emplace(appPath, app);
     for (const auto& [plugInPath, plugIn] : current->storedPlugIns) {
       if (plugInPath != path) scanner.plan.plugIns.emplace(plugInPath, plugIn);
@@ -726,44 +568,6 @@ void Registrar::removeObserver(const RegistrarObserver* observer) {
 void Registrar::waitForObservers() {
   queue_->sync([] {});
   observerQueue_->sync([] {});
-}
-
-void Registrar::startWatching() {
-  // A root that does not exist cannot be watched, and an application copied
-  // into it later would go unnoticed until the next scan: the watching
-  // registrar makes its roots.
-  for (const std::string& root : paths_.applicationRoots) {
-    std::error_code error;
-    std::filesystem::create_directories(root, error);
-    if (error) TN_LOG_ERROR(tn::log::rg(), "cannot create the application root {}: {}", root, error.message());
-  }
-  std::weak_ptr<Registrar> weakSelf = weak_from_this();
-  tn::Result<std::unique_ptr<InstallWatcher>> watcher = InstallWatcher::create(options_.settle, [weakSelf] {
-    // Never release the last reference on the watcher's own thread (the
-    // destructor joins it): hand it to the registrar queue.
-    if (std::shared_ptr<Registrar> self = weakSelf.lock()) {
-      const std::shared_ptr<tn::dispatch::SerialQueue> queue = self->queue_;
-      queue->async([self = std::move(self)] { self->scheduleRescan(); });
-    }
-  });
-  if (!watcher) {
-    TN_LOG_ERROR(tn::log::rg(), "not watching the application roots: {}", watcher.error());
-    return;
-  }
-  watcher_ = std::move(*watcher);
-}
-
-void Registrar::scheduleRescan() {
-  if (rescanQueued_.exchange(true)) return;
-  std::weak_ptr<Registrar> weakSelf = weak_from_this();
-  queue_->async([weakSelf] {
-    const std::shared_ptr<Registrar> self = weakSelf.lock();
-    if (!self) return;
-    self->rescanQueued_ = false;
-    if (tn::Result<ScanSummary> scanned = self->scanOnQueue({}); !scanned) {
-      TN_LOG_ERROR(tn::log::rg(), "rescan failed: {}", scanned.error());
-    }
-  });
 }
 
 }  // namespace registrar

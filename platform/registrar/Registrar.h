@@ -16,8 +16,9 @@
 // - application roots (RegistrarPaths): every directory directly inside a
 //   root is an application, its plug-ins are the bundles in its
 //   Support/PlugIns (and, nested, in theirs); an application holding a
-//   ".installing" file is an install placeholder. Scanned at open and, when
-//   watching, again whenever inotify reports a change under a root;
+//   ".installing" file is an install placeholder. Scanned at open (a warm
+//   start: in the background, after answering from the store) and, when
+//   watching, the application inotify reported a change in, alone;
 // - plug-in bundles registered one by one by URL (registerPlugIn), kept
 //   until unregistered or gone from disk;
 // - extension points: <root>/usr/share/tenon/extension-points/*.manifest.
@@ -44,7 +45,11 @@
 //   Store.h            the SQLite store
 //   BundleReader.h     reading bundles, fingerprints
 //   QueryNarrowing.h   which plug-ins a rules dictionary certainly excludes
-//   InstallWatcher.h   inotify over the application roots
+//   InstallWatcher.h   inotify over the application roots, changes by application
+//   ChangeScope.h      which applications a set of changed paths touches
+//   Scanner.h          reading the roots into a plan, whole or in part
+//   RegistrarState.h   the in-memory state and a scan's plan
+//   ValueInterner.h    one shared copy of equal values at load
 //   StringsTables.h    localized strings tables, cached
 //   StoredRecords.h    the persisted form of each record
 
@@ -73,6 +78,7 @@ namespace registrar {
 class InstallWatcher;
 struct State;
 struct ScanPlan;
+struct ChangeScope;
 
 // Told about installs and uninstalls, in batches, on the registrar's
 // observer queue. An uninstalled plug-in's records still answer
@@ -91,6 +97,9 @@ struct ScanSummary {
   size_t uninstalled = 0;
   size_t skipped = 0;       // bundles skipped with a log line
   bool changed = false;     // the knowledge UUID changed
+  size_t examined = 0;      // applications and registered bundles looked at
+  size_t read = 0;          // bundles read from disk (their fingerprints differed)
+  bool incremental = false; // only the changed applications were looked at
 };
 
 class Registrar : public std::enable_shared_from_this<Registrar> {
@@ -104,14 +113,24 @@ class Registrar : public std::enable_shared_from_this<Registrar> {
     Wait,        // open() returns after the roots were scanned
     Background,  // open() returns at once with the stored contents; the scan follows on the queue
     None,        // no scan (tools; benchmarks of the store alone)
+    // The daemon: Wait when the store holds nothing yet (a first start, or
+    // a store rebuilt), with its progress in the log; else Background, so
+    // that a warm start answers from the store at once. Changes found by
+    // the background scan are installs and uninstalls like any other.
+    Auto,
   };
 
   struct Options {
     Mode mode = Mode::ReadWrite;
     InitialScan initialScan = InitialScan::Wait;
     bool watch = true;                                 // read-write only: follow the roots with inotify
-    std::chrono::milliseconds settle{150};             // quiet time after the last inotify event
+    // Quiet time after files were created or written under a root (a
+    // rename into a root needs none): InstallWatcher.h, docs/registrar.md.
+    std::chrono::milliseconds settle{50};
     std::optional<std::string> locale;                 // else currentLocale() of the paths' locale file
+    // Added before a background scan starts (so that they hear of what it
+    // finds), after a waited one (they are not told of the first contents).
+    std::vector<std::shared_ptr<RegistrarObserver>> observers;
   };
 
   // Opens the store at paths.storeFile (read-write: creates it; a corrupt
@@ -178,6 +197,10 @@ class Registrar : public std::enable_shared_from_this<Registrar> {
   using Progress = std::function<void(size_t done, size_t total)>;
   tn::Result<ScanSummary> scan(const Progress& progress = {});
 
+  // The summary of the latest scan that ran, whoever asked for it (scan(),
+  // the background scan at open, a rescan after the watcher saw changes).
+  ScanSummary lastScan() const;
+
   // Registers the plug-in bundle at url: an error (InvalidBundle naming the
   // reason, NotFound) when it cannot be read. A bundle already registered
   // and unchanged is a success that changes nothing; a bundle inside a
@@ -207,9 +230,13 @@ class Registrar : public std::enable_shared_from_this<Registrar> {
 
   // On the registrar queue.
   tn::Result<ScanSummary> scanOnQueue(const Progress& progress);
+  tn::Result<ScanSummary> rescanOnQueue(const ChangeScope& scope);
   tn::Result<ScanSummary> commit(ScanPlan& plan);
+  tn::Result<ScanSummary> firstScan();
   void startWatching();
-  void scheduleRescan();
+  // Queues a rescan of scope, joined with any rescan queued and not started.
+  void scheduleRescan(const ChangeScope& scope);
+  void runPendingRescan();
   void deliver(PlugInList plugIns, bool install);
 
   const RegistrarPaths paths_;
@@ -229,7 +256,10 @@ class Registrar : public std::enable_shared_from_this<Registrar> {
   std::mutex observersMutex_;
   std::vector<std::weak_ptr<RegistrarObserver>> observers_;  // guarded by observersMutex_
 
-  std::atomic<bool> rescanQueued_{false};
+  // What the next rescan looks at; a rescan is queued while not empty.
+  std::mutex pendingMutex_;
+  std::unique_ptr<ChangeScope> pendingScope_;  // guarded by pendingMutex_
+  ScanSummary lastScan_;  // guarded by stateMutex_
 };
 
 }  // namespace registrar

@@ -13,6 +13,7 @@
 #include <fmt/format.h>
 
 #include "platform/log/Log.h"
+#include "platform/registrar/ValueInterner.h"
 #include "platform/value/Cbor.h"
 
 namespace registrar {
@@ -127,13 +128,14 @@ std::optional<std::string> columnOptionalText(sqlite3_stmt* statement, int colum
 }
 
 // Values are stored as typed CBOR. A blob that does not decode means the
-// file was damaged: the load fails and the store is rebuilt.
-bool columnValue(sqlite3_stmt* statement, int column, tn::Value& into) {
+// file was damaged: the load fails and the store is rebuilt. Decoded values
+// go through the load's interner, so that equal ones share their storage.
+bool columnValue(sqlite3_stmt* statement, int column, tn::Value& into, ValueInterner& interner) {
   const auto* bytes = static_cast<const uint8_t*>(sqlite3_column_blob(statement, column));
   const auto size = static_cast<size_t>(sqlite3_column_bytes(statement, column));
   tn::Result<tn::Value> decoded = tn::decodeCbor(std::span<const uint8_t>(bytes, size), tn::CborDialect::Typed);
   if (!decoded) return false;
-  into = std::move(*decoded);
+  into = interner.intern(*decoded);
   return true;
 }
 
@@ -275,12 +277,12 @@ tn::Result<Store::Opened> Store::open(const std::string& path, Mode mode) {
 }
 
 // One row of the plug-ins query, or none when its values do not decode.
-static std::optional<StoredPlugIn> plugInOfRow(sqlite3_stmt* row) {
+static std::optional<StoredPlugIn> plugInOfRow(sqlite3_stmt* row, ValueInterner& interner) {
   StoredPlugIn plugIn;
   plugIn.path = columnText(row, 1);
   const std::optional<tn::UUID> uuid = columnUUID(row, 0);
-  if (!uuid || !columnValue(row, 5, plugIn.info) || !columnValue(row, 6, plugIn.entitlements) ||
-      !columnValue(row, 7, plugIn.localizations)) {
+  if (!uuid || !columnValue(row, 5, plugIn.info, interner) || !columnValue(row, 6, plugIn.entitlements, interner) ||
+      !columnValue(row, 7, plugIn.localizations, interner)) {
     return std::nullopt;
   }
   plugIn.uuid = *uuid;
@@ -295,6 +297,7 @@ static std::optional<StoredPlugIn> plugInOfRow(sqlite3_stmt* row) {
 
 tn::Result<Store::Contents> Store::load() {
   Contents contents;
+  ValueInterner interner;
   if (!execute(db_, "BEGIN")) return storeError(db_, "cannot read the store");
   const auto fail = [&](std::string_view what) {
     tn::Error error = storeError(db_, what);
@@ -315,7 +318,7 @@ tn::Result<Store::Contents> Store::load() {
     app.path = columnText(row, 0);
     app.placeholder = sqlite3_column_int(row, 1) != 0;
     app.fingerprint = columnText(row, 4);
-    if (!columnValue(row, 2, app.info) || !columnValue(row, 3, app.localizations)) {
+    if (!columnValue(row, 2, app.info, interner) || !columnValue(row, 3, app.localizations, interner)) {
       damaged = fmt::format("damaged record of application {}", app.path);
       return false;
     }
@@ -329,7 +332,7 @@ tn::Result<Store::Contents> Store::load() {
                     "localizations, container, registered, fingerprint FROM plugins");
   contents.plugIns.reserve(16384);
   const bool readPlugIns = eachRow(plugIns, [&](sqlite3_stmt* row) {
-    std::optional<StoredPlugIn> plugIn = plugInOfRow(row);
+    std::optional<StoredPlugIn> plugIn = plugInOfRow(row, interner);
     if (!plugIn) {
       damaged = fmt::format("damaged record of plug-in {}", columnText(row, 1));
       return false;
@@ -345,7 +348,7 @@ tn::Result<Store::Contents> Store::load() {
     point.identifier = columnText(row, 0);
     point.path = columnText(row, 1);
     point.fingerprint = columnText(row, 3);
-    if (!columnValue(row, 2, point.sdk)) {
+    if (!columnValue(row, 2, point.sdk, interner)) {
       damaged = fmt::format("damaged record of extension point {}", point.identifier);
       return false;
     }
@@ -354,6 +357,9 @@ tn::Result<Store::Contents> Store::load() {
   });
   if (!readPoints) return fail(damaged.empty() ? "cannot read extension points" : damaged);
   if (!execute(db_, "COMMIT")) return fail("cannot finish reading the store");
+  // Everything is in memory now: the pages SQLite cached while reading are
+  // not needed until the next write.
+  sqlite3_db_release_memory(db_);
   return contents;
 }
 

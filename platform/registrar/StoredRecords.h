@@ -13,6 +13,15 @@
 
 namespace registrar {
 
+// Value::identical, without walking a dictionary both sides share: facts
+// kept from one scan to the next are copies of one immutable value, and a
+// rescan compares every one of them.
+inline bool sameValue(const tn::Value& a, const tn::Value& b) {
+  const tn::Dictionary* dictionary = a.dictionary();
+  if (dictionary != nullptr && dictionary == b.dictionary()) return true;
+  return tn::Value::identical(a, b);
+}
+
 struct StoredApp {
   std::string path;
   bool placeholder = false;
@@ -22,8 +31,8 @@ struct StoredApp {
 
   // Same facts, fingerprint aside.
   bool sameContents(const StoredApp& other) const {
-    return placeholder == other.placeholder && tn::Value::identical(info, other.info) &&
-           tn::Value::identical(localizations, other.localizations);
+    return placeholder == other.placeholder && sameValue(info, other.info) &&
+           sameValue(localizations, other.localizations);
   }
 };
 
@@ -44,9 +53,8 @@ struct StoredPlugIn {
   // (identity, dates, container and fingerprint aside).
   bool sameContents(const StoredPlugIn& other) const {
     return path == other.path && appPath == other.appPath && registeredByURL == other.registeredByURL &&
-           identifier == other.identifier && tn::Value::identical(info, other.info) &&
-           tn::Value::identical(entitlements, other.entitlements) &&
-           tn::Value::identical(localizations, other.localizations);
+           identifier == other.identifier && sameValue(info, other.info) &&
+           sameValue(entitlements, other.entitlements) && sameValue(localizations, other.localizations);
   }
 };
 

@@ -59,18 +59,23 @@ bool TNDatabase::initWithDatabase(const std::optional<std::string>& path,
   // daemon that could never save a choice should not scan anything.
   annotations_ = std::make_unique<TNDAnnotationStore>(path);
   if (!annotationDirectoryUsable(annotations_->annotationsPath())) return false;
+  // The observer is in place before the registrar verifies its store in
+  // the background (a warm start answers from the store at once), so a
+  // bundle changed while the daemon was down is announced like any install.
+  sync_ = tn::dispatch::SerialQueue::create("TNDatabase");
+  sync_->setLockRank(kLeafQueueRank);
+  observer_ = std::make_shared<RegistrarObserver>(*this);
+  registrar::Registrar::Options options;
+  options.initialScan = registrar::Registrar::InitialScan::Auto;
+  options.observers.push_back(observer_);
   tn::Result<std::shared_ptr<registrar::Registrar>> opened =
-      registrar::Registrar::open(registrar::RegistrarPaths::fromEnvironment(), {});
+      registrar::Registrar::open(registrar::RegistrarPaths::fromEnvironment(), std::move(options));
   if (!opened) {
     TN_LOG_ERROR(tn::log::ops(), "cannot open the registrar: {}", opened.error().localizedDescription());
     return false;
   }
   workspace_ = *opened;
   lookup_ = std::make_unique<tn::RegistrarLookup>(workspace_);
-  sync_ = tn::dispatch::SerialQueue::create("TNDatabase");
-  sync_->setLockRank(kLeafQueueRank);
-  observer_ = std::make_shared<RegistrarObserver>(*this);
-  workspace_->addObserver(observer_);
   if (localeQueue) {
     auto watcher = locale::LocaleWatcher::create(localeQueue, [this](const std::string& now) { localeChanged(now); });
     if (watcher) {

@@ -53,7 +53,6 @@ std::shared_ptr<TNDServer> TNDServer::initForService(const std::string& serviceN
     std::lock_guard lock(gServerMutex);
     gServer = server;
   }
-  server->setDelegate(server);
   // Matching reads elections through the server's database, and the type
   // hierarchy is loaded (its problems logged) now rather than at the first
   // match.
@@ -63,6 +62,10 @@ std::shared_ptr<TNDServer> TNDServer::initForService(const std::string& serviceN
   });
   types::TypeHierarchy::system();
   server->startPlatformServices();
+  // The registrar may already be telling of uninstalls (a warm start
+  // verifies its store in the background): the server hears of them once
+  // the supervisor it terminates them through exists.
+  server->setDelegate(server);
   server->installListenerHandlers();
   return server;
 }

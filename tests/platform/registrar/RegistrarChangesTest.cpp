@@ -7,7 +7,6 @@
 #include <filesystem>
 #include <mutex>
 
-#include "platform/dispatch/Semaphore.h"
 #include "tests/platform/registrar/RegistrarTestSupport.h"
 
 namespace registrar::test {
@@ -15,45 +14,6 @@ namespace {
 
 using namespace std::chrono_literals;
 
-// Records every batch as "+id" / "-id" lines, one vector per batch, and
-// whether an uninstalled plug-in could still be looked up when told.
-class RecordingObserver : public RegistrarObserver {
- public:
-  explicit RecordingObserver(std::shared_ptr<Registrar> registrar) : registrar_(std::move(registrar)) {}
-
-  void pluginsDidInstall(const PlugInList& plugIns) override { record('+', plugIns); }
-  void pluginsWillUninstall(const PlugInList& plugIns) override {
-    for (const PlugInPtr& plugIn : plugIns) {
-      if (registrar_->plugInForUUID(plugIn->uuid()) != plugIn) stillVisible_ = false;
-    }
-    record('-', plugIns);
-  }
-
-  std::vector<std::vector<std::string>> batches() {
-    const std::lock_guard lock(mutex_);
-    return batches_;
-  }
-  bool uninstalledStayedVisible() const { return stillVisible_; }
-  tn::dispatch::Semaphore delivered;
-
- private:
-  void record(char sign, const PlugInList& plugIns) {
-    std::vector<std::string> batch;
-    for (const PlugInPtr& plugIn : plugIns) batch.push_back(sign + plugIn->identifier());
-    {
-      const std::lock_guard lock(mutex_);
-      batches_.push_back(std::move(batch));
-    }
-    delivered.signal();
-  }
-
-  std::shared_ptr<Registrar> registrar_;
-  std::mutex mutex_;
-  std::vector<std::vector<std::string>> batches_;
-  std::atomic<bool> stillVisible_{true};
-};
-
-using Batches = std::vector<std::vector<std::string>>;
 
 TEST(RegistrarChanges, UpdateIsAnUninstallThenAnInstallWithANewUUID) {
   PlatformRoot root;

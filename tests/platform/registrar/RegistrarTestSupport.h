@@ -7,9 +7,13 @@
 
 #include <fmt/format.h>
 
+#include <atomic>
 #include <memory>
+#include <mutex>
 #include <string>
+#include <vector>
 
+#include "platform/dispatch/Semaphore.h"
 #include "platform/registrar/Registrar.h"
 #include "tests/platform/bundle/BundleTestSupport.h"
 
@@ -73,5 +77,46 @@ inline Registrar::Options quiet() {
   options.watch = false;
   return options;
 }
+
+// Records every batch as "+id" / "-id" lines, one vector per batch, and
+// whether an uninstalled plug-in could still be looked up when told.
+class RecordingObserver : public RegistrarObserver {
+ public:
+  // Without a registrar, uninstalled records are not looked up.
+  explicit RecordingObserver(std::shared_ptr<Registrar> registrar = nullptr) : registrar_(std::move(registrar)) {}
+
+  void pluginsDidInstall(const PlugInList& plugIns) override { record('+', plugIns); }
+  void pluginsWillUninstall(const PlugInList& plugIns) override {
+    for (const PlugInPtr& plugIn : plugIns) {
+      if (registrar_ && registrar_->plugInForUUID(plugIn->uuid()) != plugIn) stillVisible_ = false;
+    }
+    record('-', plugIns);
+  }
+
+  std::vector<std::vector<std::string>> batches() {
+    const std::lock_guard lock(mutex_);
+    return batches_;
+  }
+  bool uninstalledStayedVisible() const { return stillVisible_; }
+  tn::dispatch::Semaphore delivered;
+
+ private:
+  void record(char sign, const PlugInList& plugIns) {
+    std::vector<std::string> batch;
+    for (const PlugInPtr& plugIn : plugIns) batch.push_back(sign + plugIn->identifier());
+    {
+      const std::lock_guard lock(mutex_);
+      batches_.push_back(std::move(batch));
+    }
+    delivered.signal();
+  }
+
+  std::shared_ptr<Registrar> registrar_;
+  std::mutex mutex_;
+  std::vector<std::vector<std::string>> batches_;
+  std::atomic<bool> stillVisible_{true};
+};
+
+using Batches = std::vector<std::vector<std::string>>;
 
 }  // namespace registrar::test

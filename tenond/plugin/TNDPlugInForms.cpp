@@ -177,6 +177,7 @@ std::optional<tn::Error> TNDPlugIn::exportError() const { return currentForm().k
 
 tn::Value TNDPlugIn::encodedForm(const tn::Dictionary& annotations, const tn::Dictionary& extra) const {
   tn::Bytes encoded;
+  encoded.reserve(1024);
   appendEncodedForm(encoded, annotations, extra);
   return tn::Value(std::move(encoded));
 }
@@ -192,7 +193,6 @@ void TNDPlugIn::appendEncodedForm(tn::Bytes& out, const tn::Dictionary& annotati
   // The extensions when they are not part of the kept encoding.
   const tn::Dictionary late = kept->augmentation ? tn::Dictionary() : current.augmentationEntries(*this);
   const auto split = kept->encoded.begin() + static_cast<std::ptrdiff_t>(kept->split);
-  out.reserve(out.size() + kept->encoded.size() + 256);
   tn::appendCborMapHead(out, kept->beforeCount + 1 + kept->afterCount + late.size() + extra.size());
   out.insert(out.end(), kept->encoded.begin(), split);
   tn::appendCborEntry(out, tn::formkeys::kAnnotations, tn::Value(annotations), tn::CborDialect::Typed);

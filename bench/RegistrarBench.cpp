@@ -102,13 +102,17 @@ BENCHMARK(ListEveryPlugIn)->Unit(benchmark::kMillisecond);
 // The daemon's open: the store is there, so open returns with its contents
 // and verifies the roots on the registrar queue. "ready" is what a first
 // request waits for; "verified" adds the background scan (watches included).
+std::shared_ptr<registrar::Registrar> openAsTheDaemonDoes() {
+  registrar::Registrar::Options options;
+  options.initialScan = registrar::Registrar::InitialScan::Auto;
+  options.locale = "";
+  return *registrar::Registrar::open(fixture(), options);
+}
+
 void WarmOpenToReady(benchmark::State& state) {
   fixture();
   for (auto _ : state) {
-    registrar::Registrar::Options options;
-    options.initialScan = registrar::Registrar::InitialScan::Auto;
-    options.locale = "";
-    auto registrar = *registrar::Registrar::open(fixture(), options);
+    auto registrar = openAsTheDaemonDoes();
     benchmark::DoNotOptimize(registrar->installedPlugIns().size());
     state.PauseTiming();
     registrar->waitForObservers();  // not timed: let the verification end before the next round
@@ -121,10 +125,7 @@ BENCHMARK(WarmOpenToReady)->Unit(benchmark::kMillisecond);
 void WarmOpenUntilVerified(benchmark::State& state) {
   fixture();
   for (auto _ : state) {
-    registrar::Registrar::Options options;
-    options.initialScan = registrar::Registrar::InitialScan::Auto;
-    options.locale = "";
-    auto registrar = *registrar::Registrar::open(fixture(), options);
+    auto registrar = openAsTheDaemonDoes();
     registrar->waitForObservers();
     if (registrar->lastScan().changed) state.SkipWithError("the verification changed something");
   }

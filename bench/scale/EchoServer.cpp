@@ -1,14 +1,19 @@
 #include "bench/scale/EchoServer.h"
 
+#include <signal.h>
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
+#include <exception>
 #include <map>
+#include <string>
 
 #include "bench/scale/Failure.h"
 #include "platform/relay/Frame.h"
@@ -32,13 +37,19 @@ EchoServer::EchoServer(std::string path) : path_(std::move(path)) {
     epoll_event event{EPOLLIN, {.fd = fd}};
     ::epoll_ctl(epoll_, EPOLL_CTL_ADD, fd, &event);
   }
-  thread_ = std::thread([this] { serve(); });
+  process_ = ::fork();
+  if (process_ < 0) fail(std::string("the echo cannot start: ") + std::strerror(errno));
+  if (process_ == 0) {
+    ::prctl(PR_SET_PDEATHSIG, SIGKILL);  // never outlives the benchmark
+    serve();
+    ::_exit(0);
+  }
 }
 
 EchoServer::~EchoServer() {
   const uint64_t one = 1;
   if (::write(stopEvent_, &one, sizeof one) != sizeof one) std::terminate();
-  thread_.join();
+  ::waitpid(process_, nullptr, 0);
   for (const int fd : {listener_, epoll_, stopEvent_}) ::close(fd);
   ::unlink(path_.c_str());
 }

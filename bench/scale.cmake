@@ -3,7 +3,7 @@
 # against a raw socket echo (the load client in bench/scale/), warm restart,
 # incremental install, resident memory and idle CPU.
 add_executable(scale_bench ScaleBench.cpp scale/EchoServer.cpp scale/FrameClient.cpp scale/LoadClient.cpp
-               scale/ProcessWatch.cpp scale/ScaleFixture.cpp)
+               scale/Placement.cpp scale/ProcessWatch.cpp scale/ScaleFixture.cpp)
 target_link_libraries(scale_bench PRIVATE tn_registrar tn_relay tn_value)
 target_include_directories(scale_bench PRIVATE ${PROJECT_SOURCE_DIR})
 target_compile_definitions(scale_bench PRIVATE

@@ -29,6 +29,7 @@ class EchoServer {
   EchoServer& operator=(const EchoServer&) = delete;
 
   const std::string& path() const { return path_; }
+  pid_t pid() const { return process_; }
 
  private:
   void serve();

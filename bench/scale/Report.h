@@ -12,7 +12,11 @@ namespace tn::bench {
 class Report {
  public:
   void add(std::string measure, std::string figure, std::string target, bool passed) {
-    rows_.push_back({std::move(measure), std::move(figure), std::move(target), passed});
+    rows_.push_back({std::move(measure), std::move(figure), std::move(target), passed ? "PASS" : "MISS"});
+  }
+  // A figure shown for what it tells, with no target of its own.
+  void show(std::string measure, std::string figure) {
+    rows_.push_back({std::move(measure), std::move(figure), "", "shown"});
   }
 
   // Prints the table to stdout; returns how many figures missed their
@@ -22,8 +26,8 @@ class Report {
     std::printf("\n%-48s  %-44s  %-12s  %s\n", "measure", "figure", "target", "result");
     for (const Row& row : rows_) {
       std::printf("%-48s  %-44s  %-12s  %s\n", row.measure.c_str(), row.figure.c_str(), row.target.c_str(),
-                  row.passed ? "PASS" : "MISS");
-      if (!row.passed) ++missed;
+                  row.result.c_str());
+      if (row.result == "MISS") ++missed;
     }
     return missed;
   }
@@ -33,7 +37,7 @@ class Report {
     std::string measure;
     std::string figure;
     std::string target;
-    bool passed;
+    std::string result;  // PASS, MISS or shown
   };
   std::vector<Row> rows_;
 };

@@ -99,10 +99,12 @@ void ThreadPool::setPoller(Poller* poller) {
   std::lock_guard lock(mutex_);
   if (poller_ != nullptr) detail::fatal("ThreadPool::setPoller called twice");
   poller_ = poller;
-  if (threads_ == 0 && !abandoning_ && !stopping_ && !startWorkerLocked()) {
-    detail::fatal("thread pool cannot start a worker to wait for events");
-  }
-  if (sleeping_ > 0) workAvailable_.notify_one();  // one of them becomes the poller
+  if (abandoning_ || stopping_) return;
+  // A sleeping worker becomes the poller; with none (every worker busy with
+  // a task that may run long, such as a scan begun before the first socket
+  // was made), one more is started for it.
+  ensurePollerLocked();
+  if (threads_ == 0) detail::fatal("thread pool cannot start a worker to wait for events");
 }
 
 void ThreadPool::submit(std::function<void()> task) {
@@ -227,6 +229,14 @@ void ThreadPool::runFrontTask(std::unique_lock<std::mutex>& lock) {
 void ThreadPool::willRunBlock() {
   if (tlsPool == nullptr || tlsBlocksSincePoll < 0) return;
   if (++tlsBlocksSincePoll <= kBlocksBeforeHandOff) return;
+  tlsBlocksSincePoll = -1;
+  tlsPool->handOffPolling();
+}
+
+void ThreadPool::willRunLongTask() {
+  if (tlsPool == nullptr) return;
+  // Whether or not this worker came from the poller: the worker woken to
+  // become the poller may have taken a task instead.
   tlsBlocksSincePoll = -1;
   tlsPool->handOffPolling();
 }

@@ -17,7 +17,10 @@
 // work is queued than that worker can take next are sleeping workers woken.
 // At most base workers run tasks at once; when they all do, one more worker
 // keeps waiting for events (and only hands their work to the others), so a
-// long run of work never leaves the sockets unattended.
+// long run of work never leaves the sockets unattended; a single task known
+// to run long says so (willRunLongTask) and the waiting passes on at its
+// start, as it does when the pool is given its poller while every worker
+// is busy.
 // A worker that submits a task from inside a task wakes nobody either while
 // the task is the only one queued: it will take it itself as soon as its
 // current task ends, which is what a chain of hand-offs between serial
@@ -112,6 +115,10 @@ class ThreadPool final : public QueueTarget {
   // woke, and a long run of work does not keep other events waiting.
   static void willRunBlock();
   static constexpr int kBlocksBeforeHandOff = 2;
+  // Said by a task that will run long (a scan of the file system): when no
+  // worker waits for events, another one does from now on, so that no
+  // socket goes unattended until the task ends.
+  static void willRunLongTask();
 
   // Declares that the calling thread is about to block on something another
   // task may have to provide. Enter it just before waiting, leave it right

@@ -7,6 +7,7 @@
 #include <chrono>
 #include <filesystem>
 
+#include "platform/dispatch/ThreadPool.h"
 #include "platform/log/Log.h"
 #include "platform/registrar/ChangeScope.h"
 #include "platform/registrar/InstallWatcher.h"
@@ -87,6 +88,9 @@ void Registrar::runPendingRescan() {
     scope = std::exchange(*pendingScope_, ChangeScope());
   }
   if (scope.empty()) return;
+  // Reading bundles takes milliseconds to a fifth of a second: requests
+  // must not wait for it to notice their sockets.
+  tn::dispatch::ThreadPool::willRunLongTask();
   using Clock = std::chrono::steady_clock;
   const Clock::time_point started = Clock::now();
   tn::Result<ScanSummary> scanned = rescanOnQueue(scope);

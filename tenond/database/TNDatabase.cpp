@@ -57,19 +57,24 @@ bool TNDatabase::initWithDatabase(const std::optional<std::string>& path,
                                   std::shared_ptr<tn::dispatch::SerialQueue> localeQueue) {
   // The annotation file's place is checked first: it costs nothing, and a
   // daemon that could never save a choice should not scan anything.
-  annotations_ = std::make_unique<TNDAnnotationStore>(path);
-  if (!annotationDirectoryUsable(annotations_->annotationsPath())) return false;
+  if (!annotationDirectoryUsable(path ? *path : TNDAnnotationStore::defaultDatabasePath())) return false;
+  sync_ = tn::dispatch::SerialQueue::create("TNDatabase");
+  sync_->setLockRank(kLeafQueueRank);
+  // The annotation file is read on the database queue while the registrar
+  // opens its store here: they are a warm start's two largest reads, and
+  // nothing sees the store before the queue has loaded it, since every use
+  // of it is on that queue (the registrar's install events included).
+  sync_->async([this, path] { annotations_ = std::make_unique<TNDAnnotationStore>(path); });
   // The observer is in place before the registrar verifies its store in
   // the background (a warm start answers from the store at once), so a
   // bundle changed while the daemon was down is announced like any install.
-  sync_ = tn::dispatch::SerialQueue::create("TNDatabase");
-  sync_->setLockRank(kLeafQueueRank);
   observer_ = std::make_shared<RegistrarObserver>(*this);
   registrar::Registrar::Options options;
   options.initialScan = registrar::Registrar::InitialScan::Auto;
   options.observers.push_back(observer_);
   tn::Result<std::shared_ptr<registrar::Registrar>> opened =
       registrar::Registrar::open(registrar::RegistrarPaths::fromEnvironment(), std::move(options));
+  sync_->sync([] {});  // the annotations are loaded when this returns, whatever it answers
   if (!opened) {
     TN_LOG_ERROR(tn::log::ops(), "cannot open the registrar: {}", opened.error().localizedDescription());
     return false;

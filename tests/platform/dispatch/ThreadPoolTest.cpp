@@ -292,6 +292,52 @@ TEST(ThreadPoolPoller, AWorkerThatBlocksLeavesTheWaitingForEventsToAnother) {
   release.open();
 }
 
+// A task that says it will run long, taken by the worker that was waiting
+// for events, leaves the waiting to another: events are handled while it
+// runs (a registrar scan while clients connect).
+TEST(ThreadPoolPoller, ALongTaskLeavesTheWaitingForEventsToAnother) {
+  PipePoller poller;
+  Gate release;
+  Counter started, events;
+  ThreadPool pool(2, 4);
+  poller.onEvent = [&] { events.increment(); };
+  pool.setPoller(&poller);
+  ASSERT_TRUE(eventually([&] {
+    const ThreadPool::Counts counts = pool.counts();
+    return counts.threads == 1 && counts.idle == 1;
+  })) << "the one worker never waited for events";
+  pool.submit([&] {  // the only worker leaves the poller for it
+    ThreadPool::willRunLongTask();
+    started.increment();
+    release.wait();
+  });
+  started.waitFor(1);
+  poller.post();
+  EXPECT_TRUE(eventually([&] { return events.value() == 1; }, std::chrono::seconds(10)))
+      << "the event waited for the long task";
+  release.open();
+}
+
+// The poller given to a pool whose only worker is busy gets a worker of its
+// own at once, not when the task ends.
+TEST(ThreadPoolPoller, APollerGivenWhileEveryWorkerIsBusyGetsAWorker) {
+  PipePoller poller;
+  Gate release;
+  Counter started, events;
+  ThreadPool pool(2, 4);
+  poller.onEvent = [&] { events.increment(); };
+  pool.submit([&] {
+    started.increment();
+    release.wait();
+  });
+  started.waitFor(1);
+  pool.setPoller(&poller);
+  poller.post();
+  EXPECT_TRUE(eventually([&] { return events.value() == 1; }, std::chrono::seconds(10)))
+      << "nobody waited for events while the task ran";
+  release.open();
+}
+
 TEST(ThreadPoolPoller, WorkSubmittedFromOutsideReachesAWorkerWaitingInThePoller) {
   PipePoller poller;
   Counter done;

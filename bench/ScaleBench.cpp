@@ -244,18 +244,19 @@ void measureSequential(Report& report, const EchoServer& echo, const std::vector
   progress(format("every plug-in found once: median %.1f us, p99 %.1f us", firstLookups.median, firstLookups.p99));
   reportMemory(report, "after every plug-in was found", residentBytes(daemon));
 
-  const bool oneProcessor = usableProcessors() < 2;  // then every process shares it anyway
+  const std::vector<int> processors = usableProcessors();
+  const bool oneProcessor = processors.size() < 2;  // then every process shares it anyway
   reportSequential(report, "unpinned", timeSequential(echo.path(), frames, options), oneProcessor);
   if (oneProcessor) return;
   SequentialFigures together;
   {
-    const ScopedPlacement placement(0, 0, {echo.pid(), daemon});
+    const ScopedPlacement placement(processors[0], processors[0], {echo.pid(), daemon});
     together = timeSequential(echo.path(), frames, options);
   }
   reportSequential(report, "one processor", together, true);
   SequentialFigures across;
   {
-    const ScopedPlacement placement(0, 1, {echo.pid(), daemon});
+    const ScopedPlacement placement(processors[0], processors[1], {echo.pid(), daemon});
     across = timeSequential(echo.path(), frames, options);
   }
   reportSequential(report, "across processors", across, true);

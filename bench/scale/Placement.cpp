@@ -42,10 +42,14 @@ void placeProcess(pid_t process, const cpu_set_t& set) {
 
 }  // namespace
 
-int usableProcessors() {
+std::vector<int> usableProcessors() {
   cpu_set_t set;
-  if (::sched_getaffinity(0, sizeof set, &set) != 0) return 1;
-  return CPU_COUNT(&set);
+  if (::sched_getaffinity(0, sizeof set, &set) != 0) return {};
+  std::vector<int> processors;
+  for (int processor = 0; processor < CPU_SETSIZE; ++processor) {
+    if (CPU_ISSET(processor, &set)) processors.push_back(processor);
+  }
+  return processors;
 }
 
 ScopedPlacement::ScopedPlacement(int clientProcessor, int serverProcessor, const std::vector<pid_t>& servers) {

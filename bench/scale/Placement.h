@@ -19,8 +19,8 @@
 
 namespace tn::bench {
 
-// How many processors this process may run on.
-int usableProcessors();
+// The processors this process may run on, lowest first.
+std::vector<int> usableProcessors();
 
 // While it lives, the calling thread runs on `clientProcessor` and every
 // thread of each of `servers` on `serverProcessor`; then every affinity it

@@ -88,9 +88,6 @@ void Registrar::runPendingRescan() {
     scope = std::exchange(*pendingScope_, ChangeScope());
   }
   if (scope.empty()) return;
-  // Reading bundles takes milliseconds to a fifth of a second: requests
-  // must not wait for it to notice their sockets.
-  tn::dispatch::ThreadPool::willRunLongTask();
   using Clock = std::chrono::steady_clock;
   const Clock::time_point started = Clock::now();
   tn::Result<ScanSummary> scanned = rescanOnQueue(scope);
@@ -107,6 +104,9 @@ void Registrar::runPendingRescan() {
 // Rescans only what scope names, keeping the facts of everything else.
 tn::Result<ScanSummary> Registrar::rescanOnQueue(const ChangeScope& scope) {
   if (scope.everything) return scanOnQueue({});
+  // Reading bundles takes milliseconds: requests must not wait for it to
+  // notice their sockets.
+  tn::dispatch::ThreadPool::willRunLongTask();
   Scanner scanner(*state(), paths_, watcher_.get(), true);
   scanner.startFrom(scope.applications, scope.registered, scope.extensionPoints);
   for (const std::string& app : scope.applications) {

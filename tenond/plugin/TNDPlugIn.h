@@ -91,7 +91,7 @@ class TNDPlugIn final : public tn::TNPlugInCore {
   // rest (the exported form, the sandbox extensions that complete it, and
   // its typed encoding) depends only on this record and the registrar's
   // knowledge of it, so it is made once per knowledge generation and kept
-  // (the encoding and the tokens, not the form's dictionary):
+  // (its encoding only, tokens included, not the form's dictionary):
   // answering a lookup then costs the annotation's encoding and a copy of
   // bytes. Tokens can be kept because a token depends only on the key and
   // its subject; extensions are kept only when every token was issued, so a
@@ -99,7 +99,8 @@ class TNDPlugIn final : public tn::TNPlugInCore {
 
   // Adds "extensions" (file extensions for "Shared", or for the whole bundle
   // of an application extension) and "service-extension" (a service-lookup
-  // extension for the bundle identifier, unless a data plug-in) to a form.
+  // extension for the bundle identifier, unless a data plug-in) to a form,
+  // issued again (the same tokens as the kept encoding's).
   void augmentForm(tn::Dictionary& form) const;
   // Why exportForm() fails for the record as the registrar knows it now,
   // or none.

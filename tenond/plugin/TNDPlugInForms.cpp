@@ -4,6 +4,7 @@
 // user's annotation (see "Forms" in TNDPlugIn.h).
 
 #include <cstring>
+#include <memory>
 
 #include "libtenon/model/PlugInKeys.h"
 #include "libtenon/model/TNSandboxExtension.h"
@@ -30,9 +31,13 @@ std::string failureText(const tn::Error& error) {
 // dictionary would (ten thousand records are kept).
 struct TNDPlugIn::KeptForm {
   std::optional<tn::UUID> knowledge;
-  std::optional<tn::Error> exportError;  // why the form could not be exported
-  // Kept only when complete; otherwise made again on every use.
-  std::optional<tn::Dictionary> augmentation;
+  // Why the form could not be exported; rare, so not kept inline.
+  std::unique_ptr<const tn::Error> exportError;
+  // Whether the augmentation's entries are part of `encoded`: only when
+  // every token was issued; otherwise they are made again on every use.
+  // Not kept as a dictionary too: the tokens are the same whenever they are
+  // issued again, and ten thousand dictionaries of tokens took 7 MB.
+  bool augmentationKept = false;
   // The encoded entries before "annotations", and those after it followed
   // by the augmentation's (only when the augmentation is kept), in one
   // buffer: before = [0, split), after = [split, end).
@@ -117,16 +122,12 @@ TNDPlugIn::CurrentForm TNDPlugIn::makeKeptForm(const std::optional<tn::UUID>& kn
   kept->knowledge = knowledge;
   tn::Result<tn::Dictionary> exported = exportForm();
   if (!exported.ok()) {
-    kept->exportError = exported.error();
+    kept->exportError = std::make_unique<const tn::Error>(exported.error());
     exported = tn::Dictionary();
   }
   CurrentForm current;
   Augmentation augmented = augmentation();
-  if (augmented.complete) {
-    kept->augmentation = std::move(augmented.entries);
-  } else {
-    current.augmentation = std::move(augmented);
-  }
+  kept->augmentationKept = augmented.complete;
   tn::Bytes before;
   tn::Bytes& after = kept->encoded;
   bool afterAnnotations = false;
@@ -138,11 +139,13 @@ TNDPlugIn::CurrentForm TNDPlugIn::makeKeptForm(const std::optional<tn::UUID>& kn
     tn::appendCborEntry(afterAnnotations ? after : before, key, value, tn::CborDialect::Typed);
     ++(afterAnnotations ? kept->afterCount : kept->beforeCount);
   }
-  if (kept->augmentation) {
-    for (const auto& [key, value] : *kept->augmentation) {
+  if (kept->augmentationKept) {
+    for (const auto& [key, value] : augmented.entries) {
       tn::appendCborEntry(after, key, value, tn::CborDialect::Typed);
       ++kept->afterCount;
     }
+  } else {
+    current.augmentation = std::move(augmented);
   }
   kept->split = before.size();
   after.insert(after.begin(), before.begin(), before.end());
@@ -165,7 +168,6 @@ TNDPlugIn::CurrentForm TNDPlugIn::currentForm() const {
 }
 
 tn::Dictionary TNDPlugIn::CurrentForm::augmentationEntries(const TNDPlugIn& plugIn) const {
-  if (kept->augmentation) return *kept->augmentation;
   return augmentation ? augmentation->entries : plugIn.augmentation().entries;
 }
 
@@ -173,7 +175,11 @@ void TNDPlugIn::augmentForm(tn::Dictionary& form) const {
   for (const auto& [key, value] : currentForm().augmentationEntries(*this)) form.set(key, value);
 }
 
-std::optional<tn::Error> TNDPlugIn::exportError() const { return currentForm().kept->exportError; }
+std::optional<tn::Error> TNDPlugIn::exportError() const {
+  const CurrentForm current = currentForm();
+  if (!current.kept->exportError) return std::nullopt;
+  return *current.kept->exportError;
+}
 
 tn::Value TNDPlugIn::encodedForm(const tn::Dictionary& annotations, const tn::Dictionary& extra) const {
   tn::Bytes encoded;
@@ -191,7 +197,7 @@ void TNDPlugIn::appendEncodedForm(tn::Bytes& out, const tn::Dictionary& annotati
                  kept->exportError->description());
   }
   // The extensions when they are not part of the kept encoding.
-  const tn::Dictionary late = kept->augmentation ? tn::Dictionary() : current.augmentationEntries(*this);
+  const tn::Dictionary late = kept->augmentationKept ? tn::Dictionary() : current.augmentationEntries(*this);
   const auto split = kept->encoded.begin() + static_cast<std::ptrdiff_t>(kept->split);
   tn::appendCborMapHead(out, kept->beforeCount + 1 + kept->afterCount + late.size() + extra.size());
   out.insert(out.end(), kept->encoded.begin(), split);

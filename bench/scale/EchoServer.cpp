@@ -16,17 +16,16 @@
 #include <string>
 
 #include "bench/scale/Failure.h"
+#include "bench/scale/UnixSocket.h"
 #include "platform/relay/Frame.h"
 
 namespace tn::bench {
 
 EchoServer::EchoServer(std::string path) : path_(std::move(path)) {
-  sockaddr_un address{};
-  if (path_.size() >= sizeof address.sun_path) fail("echo socket path too long: " + path_);
-  address.sun_family = AF_UNIX;
-  std::memcpy(address.sun_path, path_.data(), path_.size());
+  const std::optional<sockaddr_un> address = unixSocketAddress(path_);
+  if (!address) fail("echo socket path too long: " + path_);
   listener_ = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-  if (::bind(listener_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
+  if (::bind(listener_, reinterpret_cast<const sockaddr*>(&*address), sizeof *address) != 0 ||
       ::listen(listener_, 128) != 0) {
     ::close(listener_);
     fail("the echo cannot listen on " + path_ + ": " + std::strerror(errno));

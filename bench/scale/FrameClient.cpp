@@ -2,13 +2,13 @@
 
 #include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cstring>
 
 #include "bench/scale/Failure.h"
+#include "bench/scale/UnixSocket.h"
 #include "platform/relay/Frame.h"
 #include "platform/value/Cbor.h"
 #include "platform/value/URL.h"
@@ -17,17 +17,7 @@ namespace tn::bench {
 
 using Clock = std::chrono::steady_clock;
 
-FrameClient::FrameClient(const std::string& path) {
-  sockaddr_un address{};
-  if (path.size() >= sizeof address.sun_path) return;
-  fd_ = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  address.sun_family = AF_UNIX;
-  std::memcpy(address.sun_path, path.data(), path.size());
-  if (::connect(fd_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-    ::close(fd_);
-    fd_ = -1;
-  }
-}
+FrameClient::FrameClient(const std::string& path) : fd_(connectUnixSocket(path)) {}
 
 FrameClient::~FrameClient() {
   if (fd_ >= 0) ::close(fd_);

@@ -3,13 +3,13 @@
 #include <sys/epoll.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
 
 #include "bench/scale/Failure.h"
+#include "bench/scale/UnixSocket.h"
 #include "platform/relay/Frame.h"
 
 namespace tn::bench {
@@ -18,15 +18,8 @@ namespace {
 using Clock = std::chrono::steady_clock;
 
 int connectNonBlocking(const std::string& path) {
-  sockaddr_un address{};
-  if (path.size() >= sizeof address.sun_path) fail("socket path too long: " + path);
-  address.sun_family = AF_UNIX;
-  std::memcpy(address.sun_path, path.data(), path.size());
-  const int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (::connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-    ::close(fd);
-    fail("the load client cannot connect to " + path + ": " + std::strerror(errno));
-  }
+  const int fd = connectUnixSocket(path);
+  if (fd < 0) fail("the load client cannot connect to " + path + ": " + std::strerror(errno));
   const int one = 1;
   ::ioctl(fd, FIONBIO, &one);
   return fd;

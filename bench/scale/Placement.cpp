@@ -1,26 +1,13 @@
 #include "bench/scale/Placement.h"
 
-#include <dirent.h>
-
 #include <cerrno>
 #include <cstring>
 
 #include "bench/scale/Failure.h"
+#include "bench/scale/ProcessWatch.h"
 
 namespace tn::bench {
 namespace {
-
-std::vector<pid_t> threadsOf(pid_t process) {
-  std::vector<pid_t> threads;
-  const std::string directory = "/proc/" + std::to_string(process) + "/task";
-  DIR* tasks = ::opendir(directory.c_str());
-  if (tasks == nullptr) fail("cannot list the threads of process " + std::to_string(process));
-  while (const dirent* entry = ::readdir(tasks)) {
-    if (entry->d_name[0] != '.') threads.push_back(static_cast<pid_t>(std::stol(entry->d_name)));
-  }
-  ::closedir(tasks);
-  return threads;
-}
 
 cpu_set_t only(int processor) {
   cpu_set_t set;

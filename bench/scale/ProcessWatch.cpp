@@ -88,18 +88,26 @@ uint64_t cpuTicks(pid_t pid) {
   return ticks;
 }
 
-std::map<std::string, uint64_t> threadSwitches(pid_t pid) {
-  std::map<std::string, uint64_t> switches;
-  const std::string tasks = "/proc/" + std::to_string(pid) + "/task";
+std::vector<pid_t> threadsOf(pid_t pid) {
+  std::vector<pid_t> threads;
   std::error_code error;
-  for (const auto& task : std::filesystem::directory_iterator(tasks, error)) {
-    std::string name = readFile(task.path().string() + "/comm");
-    if (!name.empty() && name.back() == '\n') name.pop_back();
-    const std::string status = readFile(task.path().string() + "/status");
-    switches[task.path().filename().string() + " " + name] =
-        statusField(status, "voluntary_ctxt_switches") + statusField(status, "nonvoluntary_ctxt_switches");
+  for (const auto& task : std::filesystem::directory_iterator("/proc/" + std::to_string(pid) + "/task", error)) {
+    threads.push_back(static_cast<pid_t>(std::stol(task.path().filename().string())));
   }
   if (error) fail("cannot list the threads of process " + std::to_string(pid));
+  return threads;
+}
+
+std::map<std::string, uint64_t> threadSwitches(pid_t pid) {
+  std::map<std::string, uint64_t> switches;
+  for (const pid_t thread : threadsOf(pid)) {
+    const std::string task = "/proc/" + std::to_string(pid) + "/task/" + std::to_string(thread);
+    std::string name = readFile(task + "/comm");
+    if (!name.empty() && name.back() == '\n') name.pop_back();
+    const std::string status = readFile(task + "/status");
+    switches[std::to_string(thread) + " " + name] =
+        statusField(status, "voluntary_ctxt_switches") + statusField(status, "nonvoluntary_ctxt_switches");
+  }
   return switches;
 }
 

@@ -37,6 +37,9 @@ uint64_t residentBytes(pid_t pid);
 // utime + stime of `pid` (every thread), in clock ticks.
 uint64_t cpuTicks(pid_t pid);
 
+// The threads of `pid` (/proc/PID/task).
+std::vector<pid_t> threadsOf(pid_t pid);
+
 // Per thread ("tid name"), voluntary plus involuntary context switches: a
 // thread asleep on an event that never comes adds nothing.
 std::map<std::string, uint64_t> threadSwitches(pid_t pid);

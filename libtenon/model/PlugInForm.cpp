@@ -61,6 +61,16 @@ Value bundleInfoForForm(const Value& bundleInfo, const std::optional<std::string
 
 }  // namespace
 
+Value TNPlugInCore::formVersion() const {
+  const Value current = version();
+  return current.isNull() ? Value(formkeys::kNoVersion) : current;
+}
+
+Value TNPlugInCore::formUUID() const {
+  const std::optional<UUID> current = uuid();
+  return current ? Value(current->string()) : Value();
+}
+
 Result<Dictionary> TNPlugInCore::exportForm() const {
   const Value bundleInfo = bundleInfoDictionary();
   if (std::optional<std::string_view> missing = missingForExport(*this, bundleInfo)) {
@@ -69,7 +79,6 @@ Result<Dictionary> TNPlugInCore::exportForm() const {
                                  location ? *location : identifier().value_or("(unnamed)"), *missing);
   }
   const std::optional<std::string> localized = localizedName();
-  const Value currentVersion = version();
   const Value currentAnnotations = annotations();
 
   Dictionary form;
@@ -79,10 +88,10 @@ Result<Dictionary> TNPlugInCore::exportForm() const {
   form.set(std::string(formkeys::kSystemResident), Value(onSystemVolume()));
   form.set(std::string(formkeys::kIdentifier), Value(*identifier()));
   form.set(std::string(formkeys::kOriginalIdentifier), Value(*originalIdentifier()));
-  form.set(std::string(formkeys::kVersion), currentVersion.isNull() ? Value(formkeys::kNoVersion) : currentVersion);
+  form.set(std::string(formkeys::kVersion), formVersion());
   form.set(std::string(formkeys::kBundleInfo), bundleInfoForForm(bundleInfo, localized));
   form.set(std::string(formkeys::kInfo), plugInDictionary());
-  form.set(std::string(formkeys::kUUID), Value(uuid()->string()));
+  form.set(std::string(formkeys::kUUID), formUUID());
   form.set(std::string(formkeys::kLastModified), Value(lastModified()));
   form.set(std::string(formkeys::kAnnotations), currentAnnotations.isNull() ? Value(Dictionary()) : currentAnnotations);
 

@@ -190,6 +190,11 @@ class TNPlugInCore {
   // identifier, path, original identifier, bundle information dictionary,
   // plug-in dictionary or UUID. The record is not changed.
   Result<Dictionary> exportForm() const;
+  // What the form carries under "version" (the version, or "<none>") and
+  // "uuid" (the UUID's text; null without a UUID), for code that compares
+  // or names plug-ins as their forms show them.
+  Value formVersion() const;
+  Value formUUID() const;
   // Fills the record from a form; false when the setup fails.
   bool setupWithForm(const Value& form);
   // Replaces annotations with the form's "annotations" (none when absent).

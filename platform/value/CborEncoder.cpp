@@ -91,8 +91,8 @@ class Writer {
   // Where the next byte would go.
   const uint8_t* cursor() const { return cursor_; }
 
-  void writeMapHead(uint64_t count) { writeHead(kMap, count); }
-  void writeArrayHead(uint64_t count) { writeHead(kArray, count); }
+  // The head of a map or array of `count` entries, whose entries follow.
+  void writeContainerHead(Major major, uint64_t count) { writeHead(major, count); }
 
   void write(const Value& value) {
     switch (value.kind()) {
@@ -204,17 +204,19 @@ void appendCbor(Bytes& out, const Value& value, CborDialect dialect) {
   assert(writer.cursor() == out.data() + out.size());
 }
 
-void appendCborMapHead(Bytes& out, uint64_t count) {
+namespace {
+
+void appendContainerHead(Bytes& out, Major major, uint64_t count) {
   const size_t start = out.size();
   out.resize(start + headSize(count));
-  Writer(out.data() + start, CborDialect::Wire).writeMapHead(count);
+  Writer(out.data() + start, CborDialect::Wire).writeContainerHead(major, count);
 }
 
-void appendCborArrayHead(Bytes& out, uint64_t count) {
-  const size_t start = out.size();
-  out.resize(start + headSize(count));
-  Writer(out.data() + start, CborDialect::Wire).writeArrayHead(count);
-}
+}  // namespace
+
+void appendCborMapHead(Bytes& out, uint64_t count) { appendContainerHead(out, kMap, count); }
+
+void appendCborArrayHead(Bytes& out, uint64_t count) { appendContainerHead(out, kArray, count); }
 
 void appendCborEntry(Bytes& out, std::string_view key, const Value& value, CborDialect dialect) {
   appendCbor(out, Value(key), dialect);

@@ -4,15 +4,12 @@
 
 #include <fmt/format.h>
 
-#include "libtenon/model/PlugInKeys.h"
 #include "libtenon/model/VersionComparison.h"
 #include "platform/log/Log.h"
 #include "tenond/server/TNDServer.h"
 
 namespace tnd {
 namespace {
-
-namespace formkeys = tn::formkeys;
 
 StepVerdict pass(std::string step, std::string reason) { return StepVerdict{std::move(step), true, std::move(reason), {}}; }
 StepVerdict refuse(std::string step, std::string reason) {
@@ -23,18 +20,6 @@ StepVerdict refuse(std::string step, std::string reason) {
 std::optional<std::string> versionText(const tn::Value& version) {
   if (const std::string* text = version.string()) return *text;
   return std::nullopt;
-}
-
-// The version a plug-in's form carries.
-tn::Value formVersion(const TNDPlugIn& plugIn) {
-  const tn::Value version = plugIn.version();
-  return version.isNull() ? tn::Value(formkeys::kNoVersion) : version;
-}
-
-// The UUID a plug-in's form carries.
-tn::Value formUUID(const TNDPlugIn& plugIn) {
-  const std::optional<tn::UUID> uuid = plugIn.uuid();
-  return uuid ? tn::Value(uuid->string()) : tn::Value();
 }
 
 }  // namespace
@@ -241,7 +226,7 @@ bool Discovery::reduceDuplicates(const TNDPlugIn& plugIn, std::vector<Result>& r
     Result& earlier = results[position];
     if (earlier.dropped) continue;
     const TNDPlugIn& earlierPlugIn = *earlier.offer.plugIn;
-    const std::optional<std::string> theirs = versionText(formVersion(earlierPlugIn));
+    const std::optional<std::string> theirs = versionText(earlierPlugIn.formVersion());
     const int order = mine && theirs ? tn::compareVersionString(*mine, *theirs) : 0;
     if (order != 0 && allVersions) continue;  // another version: both stay
     const bool wins = order > 0 || (order == 0 && preferredOver(plugIn, earlierPlugIn));
@@ -287,12 +272,12 @@ void Discovery::markReplacements(std::vector<Result>& results, DiscoveryTrace* t
     const auto found = identifier ? replacements.find(*identifier) : replacements.end();
     if (found == replacements.end()) continue;
     Result& overrider = *found->second;
-    const tn::Value overriderUUID = formUUID(*overrider.offer.plugIn);
+    const tn::Value overriderUUID = overrider.offer.plugIn->formUUID();
     result.offer.marks.set("overrider", overriderUUID);
     overrider.offer.marks.set("overriding", tn::Value(*identifier));
     if (log_) {
       TN_LOG_INFO(tn::log::ops(), "plug-in {} overrides {}", overriderUUID.description(),
-                  formUUID(*result.offer.plugIn).description());
+                  result.offer.plugIn->formUUID().description());
     }
     if (trace && result.offer.plugIn->uuid() == trace->subject) {
       trace->verdicts.push_back(

@@ -4,7 +4,6 @@
 
 #include <fmt/format.h>
 
-#include "libtenon/model/PlugInKeys.h"
 #include "platform/log/Log.h"
 #include "platform/value/Cbor.h"
 #include "platform/value/MessageValue.h"
@@ -30,8 +29,7 @@ std::string describeResults(const std::vector<Discovery::Offer>& offers) {
   std::string text = "(";
   for (const Discovery::Offer& offer : offers) {
     if (text.size() > 1) text += ", ";
-    const std::optional<tn::UUID> uuid = offer.plugIn->uuid();
-    text += (uuid ? tn::Value(uuid->string()) : tn::Value()).description();
+    text += offer.plugIn->formUUID().description();
   }
   return text + ")";
 }

@@ -60,9 +60,11 @@ class Transaction : public std::enable_shared_from_this<Transaction> {
   // Runs the request. On the service queue.
   void dispatch();
 
-  // Sends the reply on the connection (nothing when it is gone): encoded
-  // and written on the connection's own queue, after the caller's work. A
-  // reply too large for a frame is replaced by an error reply (21), so that
+  // Sends the reply on the connection (nothing when it is gone): at once
+  // when it is small and no earlier reply of the client is still queued,
+  // otherwise encoded and written on the connection's own queue, after the
+  // caller's work (replies leave in request order either way). A reply too
+  // large for a frame is replaced by an error reply (21), so that
   // every request still gets exactly one answer. Gives the request's share
   // of the client's budget back once the reply has left. Annotation changes
   // the request made are written to the annotation file first

@@ -292,50 +292,56 @@ TEST(ThreadPoolPoller, AWorkerThatBlocksLeavesTheWaitingForEventsToAnother) {
   release.open();
 }
 
+// A pool of two workers whose poller counts its events, and a task held
+// until the test lets it go: whether an event is handled while a worker is
+// busy with it. Members go in reverse: the pool first.
+struct PoolWithAHeldTask {
+  PipePoller poller;
+  Gate release;
+  Counter started, events;
+  ThreadPool pool{2, 4};
+
+  PoolWithAHeldTask() { poller.onEvent = [this] { events.increment(); }; }
+  // Submits the held task (saying first that it runs long, when asked) and
+  // waits until it runs.
+  void startHeldTask(bool saysItRunsLong) {
+    pool.submit([this, saysItRunsLong] {
+      if (saysItRunsLong) ThreadPool::willRunLongTask();
+      started.increment();
+      release.wait();
+    });
+    started.waitFor(1);
+  }
+  // Posts an event; whether it was handled before the task was let go.
+  bool eventHandledWhileHeld() {
+    poller.post();
+    const bool handled = eventually([this] { return events.value() == 1; }, std::chrono::seconds(10));
+    release.open();
+    return handled;
+  }
+};
+
 // A task that says it will run long, taken by the worker that was waiting
 // for events, leaves the waiting to another: events are handled while it
 // runs (a registrar scan while clients connect).
 TEST(ThreadPoolPoller, ALongTaskLeavesTheWaitingForEventsToAnother) {
-  PipePoller poller;
-  Gate release;
-  Counter started, events;
-  ThreadPool pool(2, 4);
-  poller.onEvent = [&] { events.increment(); };
-  pool.setPoller(&poller);
+  PoolWithAHeldTask busy;
+  busy.pool.setPoller(&busy.poller);
   ASSERT_TRUE(eventually([&] {
-    const ThreadPool::Counts counts = pool.counts();
+    const ThreadPool::Counts counts = busy.pool.counts();
     return counts.threads == 1 && counts.idle == 1;
   })) << "the one worker never waited for events";
-  pool.submit([&] {  // the only worker leaves the poller for it
-    ThreadPool::willRunLongTask();
-    started.increment();
-    release.wait();
-  });
-  started.waitFor(1);
-  poller.post();
-  EXPECT_TRUE(eventually([&] { return events.value() == 1; }, std::chrono::seconds(10)))
-      << "the event waited for the long task";
-  release.open();
+  busy.startHeldTask(true);  // the only worker leaves the poller for it
+  EXPECT_TRUE(busy.eventHandledWhileHeld()) << "the event waited for the long task";
 }
 
 // The poller given to a pool whose only worker is busy gets a worker of its
 // own at once, not when the task ends.
 TEST(ThreadPoolPoller, APollerGivenWhileEveryWorkerIsBusyGetsAWorker) {
-  PipePoller poller;
-  Gate release;
-  Counter started, events;
-  ThreadPool pool(2, 4);
-  poller.onEvent = [&] { events.increment(); };
-  pool.submit([&] {
-    started.increment();
-    release.wait();
-  });
-  started.waitFor(1);
-  pool.setPoller(&poller);
-  poller.post();
-  EXPECT_TRUE(eventually([&] { return events.value() == 1; }, std::chrono::seconds(10)))
-      << "nobody waited for events while the task ran";
-  release.open();
+  PoolWithAHeldTask busy;
+  busy.startHeldTask(false);
+  busy.pool.setPoller(&busy.poller);
+  EXPECT_TRUE(busy.eventHandledWhileHeld()) << "nobody waited for events while the task ran";
 }
 
 TEST(ThreadPoolPoller, WorkSubmittedFromOutsideReachesAWorkerWaitingInThePoller) {
